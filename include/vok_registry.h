@@ -1,0 +1,23 @@
+#ifndef VOK_REGISTRY_H
+#define VOK_REGISTRY_H
+
+#include <stdint.h>
+
+#include "vok_export.h"
+#include "vok_pkcs11.h"
+
+// One loaded PKCS#11 module. While it is registered the registry owns
+// moduleName; the record itself and libraryHandle belong to whoever removes it.
+typedef struct ModuleEntry {
+    void* libraryHandle;                // dlopen handle of the module
+    CK_FUNCTION_LIST_PTR functionList;  // filled by the module's function-list getter
+    uintptr_t reserved;                 // always 0
+    char* moduleName;                   // server id the module was connected under, or NULL
+} ModuleEntry;
+
+// Callable from any thread; a thread without a JNI environment is attached to
+// the Java VM for the lookup. A NULL name means the first module connected.
+VOK_C_API ModuleEntry* getModuleEntryByName(const char* name);
+VOK_C_API CK_FUNCTION_LIST_PTR getFunctionsByModule(const char* name);
+
+#endif

@@ -1,0 +1,99 @@
+// What each helper leaves pending: the Java class and message, read back
+// through the VM.
+#include "exceptions.h"
+
+#include <gtest/gtest.h>
+
+#include <functional>
+#include <string>
+
+#include "jvm_fixture.h"
+
+namespace {
+
+class ExceptionHelpers : public voktest::JvmTest {
+protected:
+    jlong errorCodeOf(jthrowable exception) {
+        jclass cls = env_->GetObjectClass(exception);
+        jmethodID getErrorCode = env_->GetMethodID(cls, "getErrorCode", "()J");
+        jlong code = env_->CallLongMethod(exception, getErrorCode);
+        EXPECT_FALSE(env_->ExceptionCheck());
+        return code;
+    }
+};
+
+const jchar* utf16(const char16_t* text) { return reinterpret_cast<const jchar*>(text); }
+
+const char* const kPkcs11Exception = "com.vok.smartcard.pkcs11.PKCS11Exception";
+const char* const kRuntimeException = "com.vok.smartcard.pkcs11.PKCS11RuntimeException";
+
+TEST_F(ExceptionHelpers, EachHelperThrowsItsClassAndMessage) {
+    struct {
+        const char* what;
+        std::function<void(JNIEnv*)> raise;
+        const char* className;
+        const char* message;  // null: getMessage() answers null
+    } cases[] = {
+        {"not OK return value", [](JNIEnv* env) { ckAssertReturnValueOK(env, CKR_PIN_INCORRECT); },
+         kPkcs11Exception, nullptr},
+        {"disconnected", throwDisconnectedRuntimeException, kRuntimeException,
+         "This object is not connected to a module."},
+        {"runtime with message",
+         [](JNIEnv* env) { throwPKCS11RuntimeException(env, env->NewStringUTF("token removed")); },
+         kRuntimeException, "token removed"},
+        {"runtime without message", [](JNIEnv* env) { throwPKCS11RuntimeException(env, nullptr); },
+         kRuntimeException, nullptr},
+        {"out of memory", throwOutOfMemoryError, "java.lang.OutOfMemoryError", nullptr},
+        {"I/O",
+         [](JNIEnv* env) { throwIOException(env, "libvendor.so: cannot open shared object file"); },
+         "java.io.IOException", "libvendor.so: cannot open shared object file"},
+        {"I/O, UTF-16",
+         [](JNIEnv* env) { throwIOExceptionUnicodeMessage(env, utf16(u"Gr\u00fc\u00dfe \u20ac")); },
+         "java.io.IOException", "Gr\u00fc\u00dfe \u20ac"},
+        {"I/O, UTF-16 up to the first zero",
+         [](JNIEnv* env) { throwIOExceptionUnicodeMessage(env, utf16(u"head\0tail")); },
+         "java.io.IOException", "head"},
+        {"I/O, UTF-16 empty", [](JNIEnv* env) { throwIOExceptionUnicodeMessage(env, utf16(u"")); },
+         "java.io.IOException", ""},
+        {"I/O, UTF-16 null", [](JNIEnv* env) { throwIOExceptionUnicodeMessage(env, nullptr); },
+         "java.io.IOException", ""},
+        {"file not found",
+         [](JNIEnv* env) {
+             throwFileNotFoundException(env, env->NewStringUTF("/no/such/module.so"));
+         },
+         "java.io.FileNotFoundException", "/no/such/module.so"},
+    };
+    for (const auto& c : cases) {
+        c.raise(env_);
+        voktest::ThrownException thrown = voktest::takePendingException(env_);
+        ASSERT_TRUE(thrown.thrown) << c.what;
+        EXPECT_EQ(thrown.className, c.className) << c.what;
+        EXPECT_EQ(thrown.hasMessage, c.message != nullptr) << c.what;
+        if (c.message != nullptr) {
+            EXPECT_EQ(thrown.message, c.message) << c.what;
+        }
+    }
+}
+
+TEST_F(ExceptionHelpers, ReturnValueIsPassedThroughAndCarriedWhole) {
+    EXPECT_EQ(ckAssertReturnValueOK(env_, CKR_OK), CKR_OK);
+    EXPECT_FALSE(env_->ExceptionCheck());
+
+    struct {
+        CK_RV rv;
+        jlong carried;
+    } cases[] = {
+        {CKR_BUFFER_TOO_SMALL, 0x150},
+        {CKR_VENDOR_DEFINED, static_cast<jlong>(0x80000000)},
+        {0xFFFFFFFFFFFFFFFFull, -1},
+    };
+    for (const auto& c : cases) {
+        EXPECT_EQ(ckAssertReturnValueOK(env_, c.rv), c.rv);
+        voktest::ThrownException thrown = voktest::takePendingException(env_);
+        ASSERT_TRUE(thrown.thrown) << c.rv;
+        EXPECT_EQ(thrown.className, kPkcs11Exception);
+        EXPECT_EQ(errorCodeOf(thrown.object), c.carried) << c.rv;
+    }
+}
+
+}  // namespace

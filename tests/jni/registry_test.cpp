@@ -1,0 +1,461 @@
+// The module registry, driven through a real Java VM with -Xcheck:jni: any
+// JNI misuse (a deleted reference used, a call with an exception pending, an
+// unbalanced monitor) aborts or fails the case.
+#include "registry.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <cstdlib>
+#include <memory>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "jvm_fixture.h"
+#include "log_capture.h"
+
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::ElementsAreArray;
+using voktest::LogCapture;
+using voktest::LogLine;
+using voktest::Module;
+
+const std::string kTag = "[native jni pkcs11wrapper]";
+constexpr int kDebug = 3;
+constexpr int kError = 6;
+const char* const kNoEnvLine =
+    "callback_handler: failed to get JNI environment, assuming native thread";
+const char* const kNoAttachLine = "callback_handler: failed to attach current thread";
+
+// Only their addresses matter.
+CK_FUNCTION_LIST gListA{}, gListB{}, gListC{}, gListD{};
+
+LogLine debug(const std::string& text) { return {kTag, kDebug, text}; }
+LogLine error(const std::string& text) { return {kTag, kError, text}; }
+
+std::vector<ModuleEntry*> listedEntries() {
+    std::vector<ModuleEntry*> entries;
+    for (ModuleListNode* node = moduleListHead; node != nullptr && entries.size() < 1000;
+         node = node->next)
+        entries.push_back(node->entry);
+    return entries;
+}
+
+jint envState() {
+    void* env = nullptr;
+    return voktest::javaVM()->GetEnv(&env, JNI_VERSION_1_2);
+}
+
+void freeEntry(ModuleEntry* entry) {
+    std::free(entry->moduleName);
+    std::free(entry);
+}
+
+class Registry : public voktest::JvmTest {
+protected:
+    Module add(const char* name, CK_FUNCTION_LIST_PTR list) {
+        return voktest::registerModule(name, list);
+    }
+    void finalize() { Java_com_vok_smartcard_pkcs11_Pkcs11_finalizeLibrary(env_, nullptr); }
+};
+
+TEST_F(Registry, OnLoadStoresTheVmAndAnswersJni12) {
+    LogCapture log;
+    gJavaVM = nullptr;
+    EXPECT_EQ(JNI_OnLoad(voktest::javaVM(), nullptr), 0x10002);
+    EXPECT_EQ(gJavaVM, voktest::javaVM());
+    EXPECT_THAT(log.lines(),
+                ElementsAre(debug("jni_onload : QUORVEL PKCS11Wrapper version : 2.4")));
+}
+
+TEST_F(Registry, SecondInitializeKeepsTheLock) {
+    jobject lock = moduleListLock;
+    voktest::initializeLibrary();
+    EXPECT_EQ(moduleListLock, lock);
+}
+
+TEST_F(Registry, LockObjectsAreFreshGlobalReferences) {
+    jobject first = createLockObject(env_);
+    jobject second = createLockObject(env_);
+    ASSERT_NE(first, nullptr);
+    ASSERT_NE(second, nullptr);
+    EXPECT_EQ(env_->GetObjectRefType(first), JNIGlobalRefType);
+    EXPECT_EQ(equals(env_, first, second), 0);
+    EXPECT_EQ(equals(env_, first, moduleListLock), 0);
+    destroyLockObject(env_, first);
+    destroyLockObject(env_, second);
+}
+
+TEST_F(Registry, EqualsIsIdentityWhateverTheClassSays) {
+    jobject object = voktest::newKey();
+    jobject sameObject = env_->NewGlobalRef(object);
+    jobject other = voktest::newKey();
+    jstring text = env_->NewStringUTF("same text");
+    jstring equalText = env_->NewStringUTF("same text");
+    jclass stringClass = env_->FindClass("java/lang/String");
+    jmethodID stringEquals = env_->GetMethodID(stringClass, "equals", "(Ljava/lang/Object;)Z");
+    ASSERT_TRUE(env_->CallBooleanMethod(text, stringEquals, equalText))
+        << "String.equals should hold";
+    ASSERT_FALSE(env_->ExceptionCheck());
+
+    struct {
+        const char* what;
+        jobject first;
+        jobject second;
+        int expected;
+    } cases[] = {
+        {"both null", nullptr, nullptr, 1},
+        {"first null", nullptr, object, 0},
+        {"second null", object, nullptr, 0},
+        {"two references to one object", object, sameObject, 1},
+        {"distinct objects", object, other, 0},
+        {"equal strings, distinct objects", text, equalText, 0},
+    };
+    for (const auto& c : cases) EXPECT_EQ(equals(env_, c.first, c.second), c.expected) << c.what;
+}
+
+TEST_F(Registry, SameObjectUnderTwoReferencesReplacesTheEntry) {
+    jobject object = voktest::newKey();
+    ModuleEntry* older = voktest::registerModule(env_->NewGlobalRef(object), "older", &gListA);
+    ModuleEntry* newer = voktest::registerModule(env_->NewGlobalRef(object), "newer", &gListB);
+
+    EXPECT_THAT(listedEntries(), ElementsAre(newer));
+    EXPECT_EQ(getModuleEntry(env_, object), newer);
+    EXPECT_EQ(getFunctionsByModule("newer"), &gListB);
+    EXPECT_EQ(getModuleEntryByName("older"), nullptr);
+    // The node still holds a live reference to the object.
+    EXPECT_EQ(equals(env_, moduleListHead->key, object), 1);
+    freeEntry(older);  // handed back to its owner by the replace
+}
+
+TEST_F(Registry, SameReferenceTwiceStaysValidInTheNode) {
+    jobject key = voktest::newKey();
+    ModuleEntry* older = voktest::registerModule(key, "older", &gListA);
+    ModuleEntry* newer = voktest::registerModule(key, "newer", &gListB);
+
+    EXPECT_THAT(listedEntries(), ElementsAre(newer));
+    EXPECT_EQ(getModuleEntry(env_, key), newer);
+    freeEntry(older);
+}
+
+TEST_F(Registry, EqualButDistinctObjectsGetNodesOfTheirOwn) {
+    jstring text = env_->NewStringUTF("pkcs11");
+    jstring equalText = env_->NewStringUTF("pkcs11");
+    ModuleEntry* first = voktest::registerModule(env_->NewGlobalRef(text), "first", &gListA);
+    ModuleEntry* second = voktest::registerModule(env_->NewGlobalRef(equalText), "second", &gListB);
+
+    EXPECT_THAT(listedEntries(), ElementsAre(first, second));
+    EXPECT_EQ(getModuleEntry(env_, text), first);
+    EXPECT_EQ(getModuleEntry(env_, equalText), second);
+}
+
+TEST_F(Registry, LookupByObjectLogsWhatItFound) {
+    Module alpha = add("alpha", &gListA);
+    Module unnamed = add(nullptr, &gListB);
+    Module tail = add("tail", &gListC);
+    jobject stranger = voktest::newKey();
+
+    struct {
+        const char* what;
+        jobject object;
+        ModuleEntry* expected;
+        std::vector<LogLine> lines;
+    } cases[] = {
+        {"head", alpha.object, alpha.entry, {debug("found the entry"), debug("module name alpha")}},
+        {"unnamed",
+         unnamed.object,
+         unnamed.entry,
+         {debug("found the entry"), debug("module name (null)")}},
+        {"tail", tail.object, tail.entry, {debug("found the entry"), debug("module name tail")}},
+        {"stranger", stranger, nullptr, {debug("the entry is not in the list")}},
+        {"null object", nullptr, nullptr, {}},
+    };
+    for (const auto& c : cases) {
+        LogCapture log;
+        EXPECT_EQ(getModuleEntry(env_, c.object), c.expected) << c.what;
+        EXPECT_EQ(isModulePresent(env_, c.object), c.expected != nullptr ? 1 : 0) << c.what;
+        std::vector<LogLine> twice = c.lines;  // isModulePresent logs the same again
+        twice.insert(twice.end(), c.lines.begin(), c.lines.end());
+        EXPECT_EQ(log.lines(), twice) << c.what;
+    }
+}
+
+TEST_F(Registry, LookupByObjectInEmptyRegistryLogsNothing) {
+    jobject key = voktest::newKey();
+    LogCapture log;
+    EXPECT_EQ(getModuleEntry(env_, key), nullptr);
+    EXPECT_TRUE(log.lines().empty());
+}
+
+TEST_F(Registry, LookupByName) {
+    Module alpha = add("alpha", &gListA);
+    Module gamma = add("gamma", &gListC);
+    Module noList = add("nolist", nullptr);
+    add(nullptr, &gListB);  // an unnamed tail never matches a name
+
+    struct {
+        const char* name;
+        ModuleEntry* expected;
+        const char* outcome;
+    } cases[] = {
+        {"alpha", alpha.entry, "found the entry"},
+        {"gamma", gamma.entry, "found the entry"},
+        {"nolist", noList.entry, "found the entry"},
+        {"missing", nullptr, "the entry is not in the list"},
+        {"", nullptr, "the entry is not in the list"},
+        {"alph", nullptr, "the entry is not in the list"},
+        {nullptr, alpha.entry, "found default entry"},
+    };
+    for (const auto& c : cases) {
+        const std::string shown = c.name != nullptr ? c.name : "NULL";
+        LogCapture log;
+        EXPECT_EQ(getModuleEntryByName(c.name), c.expected) << shown;
+        EXPECT_THAT(log.lines(),
+                    ElementsAre(debug("module name passed " + shown), debug(c.outcome)))
+            << shown;
+    }
+}
+
+TEST_F(Registry, FunctionsByModule) {
+    add("alpha", &gListA);
+    add("beta", &gListB);
+    add("nolist", nullptr);
+
+    const std::string call = " getFunctionsByModule";
+    struct {
+        const char* name;
+        CK_FUNCTION_LIST_PTR expected;
+        std::vector<std::string> lines;
+    } cases[] = {
+        {"beta", &gListB, {call, "module name passed beta", "found the entry"}},
+        {nullptr, &gListA, {call, "module name passed NULL", "found default entry"}},
+        {"nolist",
+         nullptr,
+         {call, "module name passed nolist", "found the entry",
+          "ckpFunctions is null getFunctionsByModule"}},
+        {"missing",
+         nullptr,
+         {call, "module name passed missing", "the entry is not in the list",
+          "failed getting module entry", "failed getting module entry"}},
+    };
+    for (const auto& c : cases) {
+        const std::string shown = c.name != nullptr ? c.name : "NULL";
+        LogCapture log;
+        EXPECT_EQ(getFunctionsByModule(c.name), c.expected) << shown;
+        EXPECT_EQ(log.texts(kTag), c.lines) << shown;
+    }
+}
+
+TEST_F(Registry, DefaultModuleIsTheFirstConnectedStill) {
+    Module first = add("first", &gListA);
+    add("second", &gListB);
+    EXPECT_EQ(getFunctionsByModule(nullptr), &gListA);
+    freeEntry(removeModuleEntry(env_, first.object));
+    EXPECT_EQ(getFunctionsByModule(nullptr), &gListB);
+}
+
+TEST_F(Registry, EmptyRegistryHasNoDefaultModule) {
+    LogCapture log;
+    EXPECT_EQ(getFunctionsByModule(nullptr), nullptr);
+    EXPECT_THAT(
+        log.lines(),
+        ElementsAre(debug(" getFunctionsByModule"), debug("module name passed NULL"),
+                    debug("failed getting module entry"), debug("failed getting module entry")));
+}
+
+TEST_F(Registry, RemoveUnlinksHeadMiddleAndTail) {
+    for (size_t removed = 0; removed < 3; ++removed) {
+        SCOPED_TRACE("removing node " + std::to_string(removed));
+        removeAllModuleEntries(env_);
+        Module modules[] = {add("a", &gListA), add("b", &gListB), add("c", &gListC)};
+        std::vector<ModuleEntry*> remaining;
+        for (size_t i = 0; i < 3; ++i)
+            if (i != removed) remaining.push_back(modules[i].entry);
+
+        ModuleEntry* entry = removeModuleEntry(env_, modules[removed].object);
+        ASSERT_EQ(entry, modules[removed].entry);
+        EXPECT_EQ(entry->functionList, modules[removed].entry->functionList);
+        EXPECT_THAT(listedEntries(), ElementsAreArray(remaining));
+        EXPECT_EQ(removeModuleEntry(env_, modules[removed].object), nullptr);
+        EXPECT_EQ(getModuleEntry(env_, modules[removed].object), nullptr);
+        EXPECT_EQ(getModuleEntryByName(std::string(1, char('a' + removed)).c_str()), nullptr);
+
+        // The list stays well formed: a new module goes after the last one left.
+        Module added = add("d", &gListD);
+        remaining.push_back(added.entry);
+        EXPECT_THAT(listedEntries(), ElementsAreArray(remaining));
+        std::free(entry);
+    }
+}
+
+TEST_F(Registry, RemovingAnUnknownObjectChangesNothing) {
+    Module a = add("a", &gListA);
+    Module b = add("b", &gListB);
+    jobject stranger = voktest::newKey();
+    EXPECT_EQ(removeModuleEntry(env_, stranger), nullptr);
+    EXPECT_EQ(removeModuleEntry(env_, nullptr), nullptr);
+    EXPECT_THAT(listedEntries(), ElementsAre(a.entry, b.entry));
+}
+
+TEST_F(Registry, RemoveAllKeepsTheLockAndTheEntries) {
+    Module a = add("a", &gListA);
+    Module b = add("b", &gListB);
+    jobject lock = moduleListLock;
+    removeAllModuleEntries(env_);
+    EXPECT_EQ(moduleListHead, nullptr);
+    EXPECT_EQ(moduleListLock, lock);
+    EXPECT_EQ(a.entry->functionList, &gListA);  // abandoned, not freed
+    EXPECT_EQ(b.entry->functionList, &gListB);
+
+    Module c = add("c", &gListC);
+    EXPECT_THAT(listedEntries(), ElementsAre(c.entry));
+}
+
+TEST_F(Registry, FinalizeAfterEveryNodeWasRemovedDeletesTheLock) {
+    Module a = add("a", &gListA);
+    Module b = add("b", &gListB);
+    std::free(removeModuleEntry(env_, a.object));
+    std::free(removeModuleEntry(env_, b.object));
+    finalize();
+    EXPECT_EQ(moduleListLock, nullptr);
+
+    EXPECT_EQ(getModuleEntry(env_, a.object), nullptr);
+    EXPECT_EQ(isModulePresent(env_, b.object), 0);
+    EXPECT_EQ(getModuleEntryByName("a"), nullptr);
+    EXPECT_EQ(getFunctionsByModule(nullptr), nullptr);
+    EXPECT_EQ(removeModuleEntry(env_, a.object), nullptr);
+}
+
+TEST_F(Registry, FinalizeEmptiesAFilledRegistryToo) {
+    Module a = add("a", &gListA);
+    finalize();
+    EXPECT_EQ(moduleListHead, nullptr);
+    EXPECT_EQ(moduleListLock, nullptr);
+    EXPECT_EQ(getModuleEntry(env_, a.object), nullptr);
+    finalize();  // a second one finds nothing to do
+    EXPECT_EQ(moduleListLock, nullptr);
+}
+
+TEST_F(Registry, UninitialisedRegistryTakesNothing) {
+    finalize();
+    jobject key = voktest::newKey();
+    ModuleEntry entry{};
+    putModuleEntry(env_, key, &entry);
+    EXPECT_EQ(moduleListHead, nullptr);
+    EXPECT_EQ(getModuleEntry(env_, key), nullptr);
+    removeAllModuleEntries(env_);
+    env_->DeleteGlobalRef(key);  // not taken over
+
+    voktest::initializeLibrary();
+    ASSERT_NE(moduleListLock, nullptr);
+    Module a = add("a", &gListA);
+    EXPECT_EQ(getModuleEntry(env_, a.object), a.entry);
+}
+
+void* failingAlloc(std::size_t) { return nullptr; }
+
+jboolean holdsLock(JNIEnv* env, jobject object) {
+    jclass thread = env->FindClass("java/lang/Thread");
+    jmethodID holds = env->GetStaticMethodID(thread, "holdsLock", "(Ljava/lang/Object;)Z");
+    jboolean held = env->CallStaticBooleanMethod(thread, holds, object);
+    EXPECT_FALSE(env->ExceptionCheck());
+    env->DeleteLocalRef(thread);
+    return held;
+}
+
+TEST_F(Registry, NodeAllocationFailureThrowsAndKeepsTheMonitor) {
+    for (bool emptyList : {true, false}) {
+        SCOPED_TRACE(emptyList ? "first node" : "appended node");
+        removeAllModuleEntries(env_);
+        std::vector<ModuleEntry*> before;
+        if (!emptyList) before.push_back(add("present", &gListA).entry);
+
+        jobject key = voktest::newKey();
+        ModuleEntry entry{};
+        gModuleListNodeAlloc = failingAlloc;
+        putModuleEntry(env_, key, &entry);
+        gModuleListNodeAlloc = std::malloc;
+
+        voktest::ThrownException thrown = voktest::takePendingException(env_);
+        EXPECT_TRUE(thrown.thrown);
+        EXPECT_EQ(thrown.className, "java.lang.OutOfMemoryError");
+        EXPECT_THAT(listedEntries(), ElementsAreArray(before));
+        // Entered once and never exited.
+        EXPECT_TRUE(holdsLock(env_, moduleListLock));
+        env_->MonitorExit(moduleListLock);
+        EXPECT_FALSE(holdsLock(env_, moduleListLock));
+        env_->DeleteGlobalRef(key);
+    }
+}
+
+// A name lookup from a thread with no JNI environment attaches it for the
+// lookup only; a thread that has one keeps it.
+TEST_F(Registry, NameLookupFromThreadsWithAndWithoutJni) {
+    Module alpha = add("alpha", &gListA);
+    struct {
+        const char* what;
+        bool javaThread;
+        std::vector<LogLine> lines;
+    } cases[] = {
+        {"native thread",
+         false,
+         {debug(" getFunctionsByModule"), debug("module name passed alpha"), error(kNoEnvLine),
+          debug("found the entry")}},
+        {"attached thread",
+         true,
+         {debug(" getFunctionsByModule"), debug("module name passed alpha"),
+          debug("found the entry")}},
+    };
+    for (const auto& c : cases) {
+        LogCapture log;
+        CK_FUNCTION_LIST_PTR found = nullptr;
+        jint before = JNI_OK, after = JNI_OK;
+        std::thread([&] {
+            std::unique_ptr<voktest::AttachedThread> attached;
+            if (c.javaThread) attached = std::make_unique<voktest::AttachedThread>();
+            before = envState();
+            found = getFunctionsByModule("alpha");
+            after = envState();
+        }).join();
+        EXPECT_EQ(found, &gListA) << c.what;
+        EXPECT_EQ(before, c.javaThread ? JNI_OK : JNI_EDETACHED) << c.what;
+        EXPECT_EQ(after, before) << c.what;
+        EXPECT_EQ(log.lines(), c.lines) << c.what;
+    }
+    EXPECT_EQ(getModuleEntry(env_, alpha.object), alpha.entry);
+}
+
+TEST_F(Registry, NativeThreadStaysAttachedWhenTheLibraryIsNotInitialised) {
+    add("alpha", &gListA);
+    finalize();
+    LogCapture log;
+    ModuleEntry sentinel{};
+    ModuleEntry* found = &sentinel;
+    jint after = JNI_EDETACHED;
+    std::thread([&] {
+        found = getModuleEntryByName("alpha");
+        after = envState();
+        if (after == JNI_OK) voktest::javaVM()->DetachCurrentThread();
+    }).join();
+    EXPECT_EQ(found, nullptr);
+    EXPECT_EQ(after, JNI_OK);
+    EXPECT_TRUE(log.contains(kTag, kNoEnvLine));
+    EXPECT_FALSE(log.contains(kTag, kNoAttachLine));
+}
+
+TEST_F(Registry, NameLookupWithoutAVmGivesUp) {
+    add("alpha", &gListA);
+    JavaVM* vm = gJavaVM;
+    gJavaVM = nullptr;
+    LogCapture log;
+    ModuleEntry* found = getModuleEntryByName("alpha");
+    gJavaVM = vm;
+    EXPECT_EQ(found, nullptr);
+    EXPECT_THAT(log.lines(), ElementsAre(debug("module name passed alpha"), error(kNoEnvLine),
+                                         error(kNoAttachLine)));
+}
+
+}  // namespace
