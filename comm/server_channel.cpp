@@ -1,0 +1,369 @@
+// Server end of the channel: one thread per process that accepts one client
+// at a time, answers the version command itself and hands every PKCS#11
+// command to the registered callback.
+
+#include <signal.h>
+#include <sys/time.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <cerrno>
+#include <cstdint>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <memory>
+#include <new>
+
+#define LOG_TAG "VOKPKCS11-COMM_SERVER"
+#include "comm_internal.h"
+#include "vok_log.h"
+
+namespace {
+
+constexpr int kListenBacklog = 1;
+constexpr useconds_t kAcceptBackoffMicros = 100 * 1000;
+
+uint8_t serverInitialized = 0;
+char serverIdCopy[256];
+pthread_t serverThreadHandle;
+int listenFd = -1;
+// Stored by init after the thread has started, read by the thread.
+std::atomic<CommandCallback> commandCallback{nullptr};
+// Written by the server thread, read by anyone without a lock.
+std::atomic<int32_t> lastRequestTime{0};
+std::atomic<int32_t> lastResponseTime{0};
+
+using MallocBuffer = std::unique_ptr<void, decltype(&std::free)>;
+
+// Seconds plus the milliseconds of the current second: the mixed unit is what
+// the usage statistics have always reported.
+int32_t usageTimeNow() {
+    timeval now;
+    gettimeofday(&now, nullptr);
+    return static_cast<int32_t>(now.tv_sec) + static_cast<int32_t>(now.tv_usec) / 1000;
+}
+
+void recordRequestTime() {
+    lastRequestTime = usageTimeNow();
+#pragma GCC diagnostic push
+    // The line's "%l" has never had a conversion; the text is kept as it is.
+#pragma GCC diagnostic ignored "-Wformat"
+#pragma GCC diagnostic ignored "-Wformat-extra-args"
+    VOK_LOGD("Last used Time Request: %l\n", static_cast<int>(lastRequestTime));
+#pragma GCC diagnostic pop
+}
+
+void recordResponseTime() {
+    lastResponseTime = usageTimeNow();
+#pragma GCC diagnostic push
+    // As above: the incomplete "%l" is part of the line.
+#pragma GCC diagnostic ignored "-Wformat"
+#pragma GCC diagnostic ignored "-Wformat-extra-args"
+    VOK_LOGD("Last used Time Response: %l\n", static_cast<int>(lastResponseTime));
+#pragma GCC diagnostic pop
+}
+
+sigset_t sigpipeSet() {
+    sigset_t set;
+    sigemptyset(&set);
+    sigaddset(&set, SIGPIPE);
+    return set;
+}
+
+// The server's sends carry no MSG_NOSIGNAL; a client that vanishes mid-send
+// must not take the service down with it.
+void blockSigpipe() {
+    sigset_t set = sigpipeSet();
+    pthread_sigmask(SIG_BLOCK, &set, nullptr);
+}
+
+void consumePendingSigpipe() {
+    sigset_t set = sigpipeSet();
+    timespec noWait = {0, 0};
+    sigtimedwait(&set, nullptr, &noWait);
+}
+
+int32_t exitWith(int32_t status) {
+    VOK_LOGD("Exit ret:%d", status);
+    return status;
+}
+
+bool closesConnection(int32_t status) {
+    return status == CHANNEL_NO_CALLBACK || status == CHANNEL_SERVER_PEER_CLOSED ||
+           status == CHANNEL_SEND_FAILED;
+}
+
+int32_t callCallback(CommandCallback callback, const void* request, int32_t length, void** response,
+                     uint32_t* responseLength) {
+    // An exception out of the dispatcher is most likely a failed allocation.
+    return vokcomm::noThrow(CHANNEL_OUT_OF_MEMORY,
+                            [&] { return callback(request, length, response, responseLength); });
+}
+
+int32_t processPkcs11Command(const void* payload, int32_t length, void** response,
+                             uint32_t* responseLength) {
+    VOK_LOGD("Entry - cmd_data_len:%d", length);
+    if (length < 1) {
+        VOK_LOGD("Invalid argument");
+        return CHANNEL_INVALID_ARGUMENTS;
+    }
+    // A command that beats init's store of the callback gets no answer.
+    CommandCallback callback = commandCallback;
+    int32_t status = callback == nullptr
+                         ? static_cast<int32_t>(CHANNEL_NO_CALLBACK)
+                         : callCallback(callback, payload, length, response, responseLength);
+    return exitWith(status);
+}
+
+int32_t processVersionCommand(const void* payload, int32_t length, void** response,
+                              uint32_t* responseLength) {
+    VOK_LOGD("Entry");
+    if (length != static_cast<int32_t>(sizeof(int32_t))) {
+        VOK_LOGD("Command len invalid");
+        return CHANNEL_BAD_REQUEST_HEADER;
+    }
+    // Same allocator as the callback's answers, so one release path fits both.
+    std::unique_ptr<uint8_t[]> reply(new (std::nothrow) uint8_t[sizeof(int32_t)]);
+    if (!reply) {
+        VOK_LOGD("Malloc error");
+        return CHANNEL_OUT_OF_MEMORY;
+    }
+    int32_t clientVersion;
+    std::memcpy(&clientVersion, payload, sizeof(clientVersion));
+    VOK_LOGD("Client ver:%d Server ver:%d", clientVersion, CHANNEL_PROTOCOL_VERSION);
+    if (clientVersion != CHANNEL_PROTOCOL_VERSION) {
+        // No answer: the client's handshake runs into its receive timeout.
+        VOK_LOGD("Client and server version mismatch");
+        return CHANNEL_VERSION_MISMATCH;
+    }
+    const int32_t serverVersion = CHANNEL_PROTOCOL_VERSION;
+    std::memcpy(reply.get(), &serverVersion, sizeof(serverVersion));
+    *response = reply.release();
+    *responseLength = sizeof(serverVersion);
+    return CHANNEL_OK;
+}
+
+int32_t processCommand(int32_t id, const void* payload, int32_t length, void** response,
+                       uint32_t* responseLength) {
+    switch (id) {
+        case FRAME_ID_PKCS11:
+            return processPkcs11Command(payload, length, response, responseLength);
+        case FRAME_ID_VERSION:
+            return processVersionCommand(payload, length, response, responseLength);
+        default:
+            return CHANNEL_UNKNOWN_COMMAND;
+    }
+}
+
+int32_t sendResponse(int fd, FrameHeader header, void* response, uint32_t responseLength) {
+    // Allocated with new[] by the callback (and by the version command).
+    std::unique_ptr<uint8_t[]> owned(static_cast<uint8_t*>(response));
+    header.data_len = static_cast<int32_t>(responseLength);
+    header.type = FRAME_TYPE_RESPONSE;
+    header.status = CHANNEL_OK;
+    int32_t status = server_send_data(fd, &header, sizeof(header));
+    if (status != CHANNEL_OK) {
+        VOK_LOGD("Send header failed %d", status);
+        return status;
+    }
+    status = server_send_data(fd, owned.get(), header.data_len);
+    recordResponseTime();
+    owned.reset();
+    return exitWith(status);
+}
+
+int32_t processClientCommand(int fd) {
+    VOK_LOGD("\n\n================");
+    VOK_LOGD("Entry");
+    void* response = nullptr;
+    uint32_t responseLength = 0;
+    FrameHeader header = {};
+
+    int32_t status = server_recv_data(fd, &header, sizeof(header));
+    VOK_LOGD("Header data length field value :%d", header.data_len);
+    VOK_LOGD("Received command:%d", header.id);
+    if (status != CHANNEL_OK) {
+        VOK_LOGD("server_recv_data failed ret:%d", status);
+        return status;
+    }
+    if (header.data_len == 0 || header.type != FRAME_TYPE_REQUEST) {
+        VOK_LOGD("Receive header failed");
+        return CHANNEL_BAD_REQUEST_HEADER;
+    }
+    recordRequestTime();
+
+    // The peer decides the size; a negative one fails here. The unread payload
+    // is then taken for the next header.
+    MallocBuffer payload(std::malloc(static_cast<size_t>(header.data_len)), &std::free);
+    if (!payload) {
+        VOK_LOGD("Malloc failed");
+        return CHANNEL_OUT_OF_MEMORY;
+    }
+    status = server_recv_data(fd, payload.get(), header.data_len);
+    if (status != CHANNEL_OK) {
+        VOK_LOGD("Receive command data failed");
+        return status;
+    }
+    status = processCommand(header.id, payload.get(), header.data_len, &response, &responseLength);
+    payload.reset();
+    if (status != CHANNEL_OK) {
+        VOK_LOGD("process command returned :%d", status);
+        return status;
+    }
+    return sendResponse(fd, header, response, responseLength);
+}
+
+void serveClient(int fd) {
+    int32_t status;
+    do {
+        status = processClientCommand(fd);
+        VOK_LOGD("process_client_command ret :%d", status);
+    } while (!closesConnection(status));
+}
+
+bool isResourceShortage(int error) {
+    return error == EMFILE || error == ENFILE || error == ENOBUFS || error == ENOMEM;
+}
+
+// Never hands back -1: a failed accept is logged and tried again, after a
+// pause when the process or system has run out of something.
+int acceptClient(int fd) {
+    for (;;) {
+        int client = accept(fd, nullptr, nullptr);
+        if (client >= 0) return client;
+        const int error = errno;
+        if (error == EINTR) continue;
+        VOK_LOGD("socket accept failed");
+        if (isResourceShortage(error)) usleep(kAcceptBackoffMicros);
+    }
+}
+
+int32_t failSetUp(const char* line, int32_t status) {
+    VOK_LOGD("%s", line);
+    close(listenFd);
+    listenFd = -1;
+    return status;
+}
+
+int32_t runServer(const char* serverId) {
+    blockSigpipe();
+    VOK_LOGD("Entry %s", serverId);
+    listenFd = socket(AF_UNIX, SOCK_STREAM, 0);
+    if (listenFd == -1) {
+        VOK_LOGD("socket creation failed");
+        return CHANNEL_SOCKET_CREATE_FAILED;
+    }
+    sockaddr_un addr;
+    vokcomm::buildSocketAddress(serverId, &addr);
+    const int reuse = 1;
+    if (setsockopt(listenFd, SOL_SOCKET, SO_REUSEADDR, &reuse, sizeof(reuse)) == -1)
+        VOK_LOGD("SetSockOpt of SO_REUSEADDR returned error %d", -1);
+    if (bind(listenFd, reinterpret_cast<const sockaddr*>(&addr), vokcomm::socketAddressLength()) ==
+        -1)
+        return failSetUp("socket bind failed", CHANNEL_BIND_FAILED);
+    if (listen(listenFd, kListenBacklog) == -1)
+        return failSetUp("socket listen failed", CHANNEL_LISTEN_FAILED);
+
+    VOK_LOGD("Wait for new client %s", serverId);
+    for (;;) {
+        int client = acceptClient(listenFd);
+        VOK_LOGD("Client connected - socket id:%d", client);
+        serveClient(client);
+        VOK_LOGD("Socket error. Wait for new client");
+        close(client);
+        VOK_LOGD("Wait for new client %s", serverId);
+    }
+}
+
+void* serverThreadMain(void* serverId) {
+    int32_t status = vokcomm::noThrow(
+        CHANNEL_OUT_OF_MEMORY, [&] { return runServer(static_cast<const char*>(serverId)); });
+    return reinterpret_cast<void*>(static_cast<intptr_t>(status));
+}
+
+int32_t startServer(const char* serverId, CommandCallback callback) {
+    VOK_LOGD("Entry - server id %s", serverId != nullptr ? serverId : "(null)");
+    if (serverId == nullptr || callback == nullptr) {
+        VOK_LOGD("Invalid arguments");
+        return CHANNEL_INVALID_ARGUMENTS;
+    }
+    if (serverInitialized == 1) {
+        VOK_LOGD("Already initialized");
+        return CHANNEL_ALREADY_INITIALIZED;
+    }
+    serverIdCopy[sizeof(serverIdCopy) - 1] = '\0';
+    std::strncpy(serverIdCopy, serverId, sizeof(serverIdCopy) - 1);
+    const int error = pthread_create(&serverThreadHandle, nullptr, serverThreadMain, serverIdCopy);
+    if (error != 0) {
+        VOK_LOGD("Thread create failed %d", error);
+        return CHANNEL_THREAD_CREATE_FAILED;
+    }
+    commandCallback = callback;
+    serverInitialized = 1;
+    VOK_LOGD("Exit - success");
+    return CHANNEL_OK;
+}
+
+}  // namespace
+
+int32_t server_recv_data(int fd, void* buf, int32_t len) {
+    VOK_LOGD("Entry - Recv buf len:%d", len);
+    if (fd < 0 || buf == nullptr || len < 1) {
+        std::printf("[%s]:%s() - Invalid argument\n", LOG_TAG, "server_recv_data");
+        return CHANNEL_INVALID_ARGUMENTS;
+    }
+    uint8_t* p = static_cast<uint8_t*>(buf);
+    int32_t remaining = len;
+    while (remaining > 0) {
+        ssize_t n = vokcomm::recvRetrying(fd, p, static_cast<size_t>(remaining), 0);
+        VOK_LOGD("Bytes read:%d", static_cast<int>(n));
+        if (n < 1) return exitWith(n < 0 ? CHANNEL_SERVER_IO_FAILED : CHANNEL_SERVER_PEER_CLOSED);
+        p += n;
+        remaining -= static_cast<int32_t>(n);
+    }
+    return exitWith(CHANNEL_OK);
+}
+
+int32_t server_send_data(int fd, const void* buf, int32_t len) {
+    VOK_LOGD("Entry - send data len:%d", len);
+    if (fd < 0 || buf == nullptr || len < 1) {
+        VOK_LOGD("Invalid argument");
+        return CHANNEL_INVALID_ARGUMENTS;
+    }
+    const uint8_t* p = static_cast<const uint8_t*>(buf);
+    int32_t remaining = len;
+    while (remaining > 0) {
+        ssize_t n = vokcomm::sendRetrying(fd, p, static_cast<size_t>(remaining), 0);
+        if (n < 0 && errno == EPIPE) consumePendingSigpipe();
+        VOK_LOGD("Bytes written:%d", static_cast<int>(n));
+        if (n < 1) return exitWith(n < 0 ? CHANNEL_SEND_FAILED : CHANNEL_SERVER_IO_FAILED);
+        p += n;
+        remaining -= static_cast<int32_t>(n);
+    }
+    return exitWith(CHANNEL_OK);
+}
+
+VOK_C_API ChannelStatus vokpkcs11_comm_server_init(const char* serverId, CommandCallback callback) {
+    return vokcomm::noThrow(CHANNEL_OUT_OF_MEMORY, [&] { return startServer(serverId, callback); });
+}
+
+VOK_C_API ChannelStatus vokpkcs11_comm_server_deinit(void) {
+    VOK_LOGD("vokpkcs11_comm_server_deinit Entry");
+    if (serverInitialized != 1) {
+        VOK_LOGD("Not initialized");
+        return CHANNEL_NOT_INITIALIZED;
+    }
+    // Nothing is stopped: the thread serves until the process ends.
+    VOK_LOGD("Exit");
+    return CHANNEL_OK;
+}
+
+VOK_C_API int32_t vokpkcs11_comm_server_getLastUsageTime(void) {
+    // A request newer than the last response is still being worked on.
+    const int32_t request = lastRequestTime;
+    const int32_t response = lastResponseTime;
+    return request > response ? -1 : response;
+}
+
+pthread_t vokcomm::serverThread() { return serverThreadHandle; }

@@ -1,0 +1,454 @@
+// The server end against raw clients that speak the frame protocol by hand,
+// and the two ends together.
+
+#include <pthread.h>
+#include <sys/resource.h>
+#include <sys/time.h>
+
+#include <array>
+#include <atomic>
+#include <cerrno>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <functional>
+#include <list>
+#include <new>
+#include <thread>
+
+#include "comm_internal.h"
+#include "log_capture.h"
+#include "raw_peer.h"
+
+// Every delete[] of this process is recorded, to show how the channel
+// releases the callback's answers. The array forms get their own pair on
+// malloc so that nothing else is paired with them.
+namespace {
+std::array<std::atomic<const void*>, 1024> arrayReleases;
+std::atomic<size_t> arrayReleaseCount{0};
+}  // namespace
+
+void* operator new[](std::size_t size, const std::nothrow_t&) noexcept {
+    return std::malloc(size ? size : 1);
+}
+
+void* operator new[](std::size_t size) {
+    if (void* p = operator new[](size, std::nothrow)) return p;
+    throw std::bad_alloc();
+}
+
+void operator delete[](void* p) noexcept {
+    if (p != nullptr) arrayReleases[arrayReleaseCount++ % arrayReleases.size()] = p;
+    std::free(p);
+}
+
+void operator delete[](void* p, std::size_t) noexcept { operator delete[](p); }
+
+namespace voktest {
+namespace {
+
+const char kServerTag[] = "VOKPKCS11-COMM_SERVER";
+const WireHeader kVersionRequest{100, 103, 0, 4};
+const WireHeader kVersionAnswer{100, 104, 0, 4};
+
+bool releasedAsArray(const void* p) {
+    for (const auto& slot : arrayReleases)
+        if (slot == p) return true;
+    return false;
+}
+
+// Hands `bytes` over the way the dispatcher does, with new[].
+int32_t answer(const Bytes& bytes, void** response, uint32_t* length) {
+    auto* buffer = new (std::nothrow) uint8_t[bytes.size()];
+    if (buffer == nullptr) return CHANNEL_OUT_OF_MEMORY;
+    if (!bytes.empty()) std::memcpy(buffer, bytes.data(), bytes.size());
+    *response = buffer;
+    *length = static_cast<uint32_t>(bytes.size());
+    return CHANNEL_OK;
+}
+
+// What the callback does with one request in the running test.
+std::function<int32_t(const Bytes& request, void** response, uint32_t* length)> commandHandler =
+    answer;
+
+int32_t testCallback(const void* request, int32_t length, void** response,
+                     uint32_t* responseLength) {
+    EXPECT_EQ(nullptr, *response);
+    EXPECT_EQ(0u, *responseLength);
+    const auto* p = static_cast<const uint8_t*>(request);
+    return commandHandler(Bytes(p, p + length), response, responseLength);
+}
+
+WireHeader commandHeader(size_t length) { return {101, 103, 0, static_cast<int32_t>(length)}; }
+
+// The client's next answer is the one to this version request: whatever was
+// sent before it was answered with nothing.
+void expectVersionAnswered(RawSocket& client) {
+    WireHeader h;
+    Bytes payload;
+    ASSERT_TRUE(client.sendFrame(kVersionRequest, int32Bytes(1)));
+    ASSERT_TRUE(client.recvFrame(&h, &payload));
+    EXPECT_EQ(kVersionAnswer, h);
+    EXPECT_EQ(int32Bytes(1), payload);
+}
+
+class ServerChannelTest : public ::testing::Test {
+protected:
+    // Waits until the server thread only waits for input, so that it does not
+    // log into a capture being torn down, and leaves the clients' connections
+    // open until the process ends.
+    void TearDown() override {
+        for (auto& client : clients) client.leaveOpen();
+        if (!serverRunning) return;
+        const std::string waiting = "Wait for new client " + id;
+        EXPECT_TRUE(waitUntil([&] {
+            auto all = lines();
+            return !all.empty() &&
+                   (all.back() == "Entry - Recv buf len:16" || all.back() == waiting);
+        }));
+    }
+
+    void startServer(const std::string& serverId) {
+        ASSERT_EQ(0, vokpkcs11_comm_server_init(serverId.c_str(), testCallback));
+        serverRunning = true;
+        ASSERT_TRUE(
+            waitUntil([&] { return log.contains(kServerTag, "Wait for new client " + serverId); }));
+    }
+
+    RawSocket& start() {
+        startServer(id);
+        return connectClient();
+    }
+
+    RawSocket& connectClient() {
+        clients.push_back(rawConnect(id));
+        EXPECT_TRUE(clients.back().valid());
+        return clients.back();
+    }
+
+    std::vector<std::string> lines() const { return log.texts(kServerTag); }
+    bool waitForLine(const std::string& line) const {
+        return waitUntil([&] { return log.contains(kServerTag, line); });
+    }
+
+    LogCapture log;
+    std::string id = uniqueServerId();
+    bool serverRunning = false;
+    std::list<RawSocket> clients;
+};
+
+TEST_F(ServerChannelTest, InitDeinitStatuses) {
+    EXPECT_EQ(2, vokpkcs11_comm_server_deinit());
+    EXPECT_EQ("Not initialized", lines().back());
+    EXPECT_EQ(5, vokpkcs11_comm_server_init(nullptr, testCallback));
+    EXPECT_EQ(5, vokpkcs11_comm_server_init(id.c_str(), nullptr));
+    EXPECT_EQ("Invalid arguments", lines().back());
+
+    RawSocket& client = start();
+    EXPECT_TRUE(inOrder(lines(), {"Entry - server id " + id, "Exit - success"}));
+    EXPECT_EQ(1, vokpkcs11_comm_server_init(id.c_str(), testCallback));
+    EXPECT_EQ(0, vokpkcs11_comm_server_deinit());
+    EXPECT_TRUE(inOrder(lines(), {"vokpkcs11_comm_server_deinit Entry", "Exit"}));
+    // deinit stops nothing.
+    EXPECT_EQ(1, vokpkcs11_comm_server_init(id.c_str(), testCallback));
+    expectVersionAnswered(client);
+}
+
+TEST_F(ServerChannelTest, VersionCommandIsAnsweredOnlyForVersionOne) {
+    RawSocket& client = start();
+    ASSERT_TRUE(client.sendFrame(kVersionRequest, int32Bytes(2)));
+    ASSERT_TRUE(client.sendFrame({100, 103, 0, 8}, Bytes(8, 1)));
+    expectVersionAnswered(client);
+    EXPECT_TRUE(inOrder(lines(), {"Client ver:2 Server ver:1", "Client and server version mismatch",
+                                  "process command returned :4", "process_client_command ret :4",
+                                  "Command len invalid", "process command returned :18",
+                                  "Client ver:1 Server ver:1"}));
+}
+
+TEST_F(ServerChannelTest, InvalidHeadersAndUnknownCommandsGetNoAnswerAndKeepTheConnection) {
+    RawSocket& client = start();
+    ASSERT_TRUE(client.sendHeader({101, 104, 0, 4}));                  // a response type
+    ASSERT_TRUE(client.sendHeader({101, 103, 0, 0}));                  // no payload
+    ASSERT_TRUE(client.sendFrame({19, 103, 0, 3}, textBytes("abc")));  // unknown id
+    ASSERT_TRUE(client.sendHeader({101, 103, 0, -8}));                 // cannot be allocated
+    expectVersionAnswered(client);
+    EXPECT_TRUE(inOrder(lines(), {"Receive header failed", "process_client_command ret :18",
+                                  "Receive header failed", "process_client_command ret :18",
+                                  "process command returned :19", "process_client_command ret :19",
+                                  "Malloc failed", "process_client_command ret :21"}));
+}
+
+TEST_F(ServerChannelTest, CommandIsAnsweredWithTheCallbacksBufferReleasedByDeleteArray) {
+    const void* handedOver = nullptr;
+    Bytes seen;
+    commandHandler = [&](const Bytes& request, void** response, uint32_t* length) {
+        seen = request;
+        int32_t status = answer(textBytes("HELLO!"), response, length);
+        handedOver = *response;
+        return status;
+    };
+    RawSocket& client = start();
+    ASSERT_TRUE(client.sendFrame(commandHeader(5), textBytes("hello")));
+    Bytes raw;
+    ASSERT_TRUE(client.recvBytes(22, &raw));
+    EXPECT_EQ(encodeHeader({101, 104, 0, 6}), Bytes(raw.begin(), raw.begin() + 16));
+    EXPECT_EQ(textBytes("HELLO!"), Bytes(raw.begin() + 16, raw.end()));
+    EXPECT_EQ(textBytes("hello"), seen);
+    expectVersionAnswered(client);  // the first answer has been fully dealt with
+    EXPECT_TRUE(releasedAsArray(handedOver));
+}
+
+TEST_F(ServerChannelTest, EmptyAnswerSendsAHeaderWithDataLenZero) {
+    commandHandler = [](const Bytes&, void** response, uint32_t* length) {
+        return answer({}, response, length);
+    };
+    RawSocket& client = start();
+    WireHeader h;
+    Bytes payload;
+    ASSERT_TRUE(client.sendFrame(commandHeader(1), {1}));
+    ASSERT_TRUE(client.recvFrame(&h, &payload));
+    EXPECT_EQ((WireHeader{101, 104, 0, 0}), h);
+    expectVersionAnswered(client);
+    EXPECT_TRUE(inOrder(lines(), {"Entry - send data len:0", "Invalid argument", "Exit ret:5",
+                                  "process_client_command ret :5"}));
+}
+
+struct CallbackStatusCase {
+    int32_t status;
+    bool closes;
+};
+
+void PrintTo(const CallbackStatusCase& c, std::ostream* os) { *os << c.status; }
+
+class CallbackStatus : public ServerChannelTest,
+                       public ::testing::WithParamInterface<CallbackStatusCase> {};
+
+TEST_P(CallbackStatus, SendsNothingAndClosesOnlyOnTwoTenEleven) {
+    const int32_t status = GetParam().status;
+    commandHandler = [&](const Bytes&, void**, uint32_t*) { return status; };
+    RawSocket& client = start();
+    ASSERT_TRUE(client.sendFrame(commandHeader(1), {1}));
+    if (GetParam().closes) {
+        EXPECT_TRUE(client.readsEndOfStream());
+        expectVersionAnswered(connectClient());
+    } else {
+        expectVersionAnswered(client);
+    }
+    const std::string s = std::to_string(status);
+    EXPECT_TRUE(inOrder(lines(), {"Exit ret:" + s, "process command returned :" + s,
+                                  "process_client_command ret :" + s}));
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Statuses, CallbackStatus,
+    ::testing::Values(CallbackStatusCase{2, true}, CallbackStatusCase{10, true},
+                      CallbackStatusCase{11, true}, CallbackStatusCase{1, false},
+                      CallbackStatusCase{12, false}, CallbackStatusCase{21, false}),
+    [](const ::testing::TestParamInfo<CallbackStatusCase>& info) {
+        return "Status" + std::to_string(info.param.status);
+    });
+
+TEST_F(ServerChannelTest, ResetByClientIsTwelveThenTheClosedConnectionIsDropped) {
+    RawSocket& first = start();
+    ASSERT_TRUE(first.sendFrame(kVersionRequest, int32Bytes(1)));
+    ASSERT_TRUE(first.waitQueued(20));
+    first.close();  // the answer unread: the server's next receive is reset
+    ASSERT_TRUE(waitForLine("Socket error. Wait for new client"));
+    EXPECT_TRUE(
+        inOrder(lines(), {"server_recv_data failed ret:12", "process_client_command ret :12",
+                          "server_recv_data failed ret:10", "process_client_command ret :10",
+                          "Socket error. Wait for new client", "Wait for new client " + id}));
+    expectVersionAnswered(connectClient());
+}
+
+TEST_F(ServerChannelTest, ClientGoneDuringLargeAnswerDoesNotStopTheService) {
+    commandHandler = [](const Bytes&, void** response, uint32_t* length) {
+        *length = 64 << 20;
+        *response = new (std::nothrow) uint8_t[*length]();
+        return *response != nullptr ? CHANNEL_OK : CHANNEL_OUT_OF_MEMORY;
+    };
+    RawSocket& first = start();
+    WireHeader h;
+    ASSERT_TRUE(first.sendFrame(commandHeader(1), {1}));
+    ASSERT_TRUE(first.recvHeader(&h));
+    EXPECT_EQ(64 << 20, h.dataLen);
+    first.close();
+    // SIGPIPE keeps its default action here: raised in the server thread, it
+    // would end this process.
+    expectVersionAnswered(connectClient());
+    EXPECT_TRUE(inOrder(lines(), {"Exit ret:11", "process_client_command ret :11",
+                                  "Socket error. Wait for new client"}));
+}
+
+// Seconds plus the milliseconds of the current second, as the server keeps it.
+bool plausibleUsageTime(int32_t value, const timeval& before, const timeval& after) {
+    for (time_t s = before.tv_sec; s <= after.tv_sec; ++s) {
+        const long ms = value - static_cast<long>(s);
+        if (ms < 0 || ms > 999) continue;
+        const bool notEarlier = s > before.tv_sec || ms >= before.tv_usec / 1000;
+        const bool notLater = s < after.tv_sec || ms <= after.tv_usec / 1000;
+        if (notEarlier && notLater) return true;
+    }
+    return false;
+}
+
+TEST_F(ServerChannelTest, UsageTimeIsMinusOneWhileACommandIsWorkedOn) {
+    Gate entered, release;
+    commandHandler = [&](const Bytes& request, void** response, uint32_t* length) {
+        entered.open();
+        release.wait();
+        return answer(request, response, length);
+    };
+    RawSocket& client = start();
+    EXPECT_EQ(0, vokpkcs11_comm_server_getLastUsageTime());
+    ASSERT_TRUE(client.sendFrame(commandHeader(1), {1}));
+    ASSERT_TRUE(entered.wait());
+    EXPECT_EQ(-1, vokpkcs11_comm_server_getLastUsageTime());
+    release.open();
+    WireHeader h;
+    Bytes payload;
+    ASSERT_TRUE(client.recvFrame(&h, &payload));
+
+    // A window within one second, so that the request's and the response's
+    // values compare as times.
+    timeval before, after;
+    do {
+        gettimeofday(&before, nullptr);
+        expectVersionAnswered(client);
+        ASSERT_TRUE(waitForLine("process_client_command ret :0"));
+        gettimeofday(&after, nullptr);
+    } while (before.tv_sec != after.tv_sec);
+    const int32_t value = vokpkcs11_comm_server_getLastUsageTime();
+    EXPECT_TRUE(plausibleUsageTime(value, before, after)) << value;
+
+    char expected[64];
+#pragma GCC diagnostic push
+#pragma GCC diagnostic ignored "-Wformat"
+#pragma GCC diagnostic ignored "-Wformat-extra-args"
+    std::snprintf(expected, sizeof(expected), "Last used Time Response: %l\n", value);
+#pragma GCC diagnostic pop
+    EXPECT_TRUE(log.contains(kServerTag, expected));
+}
+
+struct SetUpFailureCase {
+    const char* name;
+    int32_t exitStatus;
+    const char* line;
+};
+
+void PrintTo(const SetUpFailureCase& c, std::ostream* os) { *os << c.name; }
+
+class ServerSetUpFailure : public ServerChannelTest,
+                           public ::testing::WithParamInterface<SetUpFailureCase> {};
+
+TEST_P(ServerSetUpFailure, EndsTheThreadAfterInitSucceeded) {
+    RawListener squatter(id);
+    if (GetParam().exitStatus == CHANNEL_SOCKET_CREATE_FAILED) {
+        ASSERT_TRUE(setSoftLimit(RLIMIT_NOFILE, static_cast<uint64_t>(lowestFreeDescriptor())));
+    }
+    ASSERT_EQ(0, vokpkcs11_comm_server_init(id.c_str(), testCallback));
+    void* exitValue = nullptr;
+    ASSERT_EQ(0, pthread_join(vokcomm::serverThread(), &exitValue));
+    EXPECT_EQ(GetParam().exitStatus, static_cast<int32_t>(reinterpret_cast<intptr_t>(exitValue)));
+    EXPECT_TRUE(inOrder(lines(), {"Entry " + id, GetParam().line}));
+}
+
+INSTANTIATE_TEST_SUITE_P(Causes, ServerSetUpFailure,
+                         ::testing::Values(SetUpFailureCase{"NameTaken", 8, "socket bind failed"},
+                                           SetUpFailureCase{"NoDescriptor", 6,
+                                                            "socket creation failed"}),
+                         [](const ::testing::TestParamInfo<SetUpFailureCase>& info) {
+                             return std::string(info.param.name);
+                         });
+
+TEST_F(ServerChannelTest, ThreadCreationFailureIsFourteenAndInitCanBeRetried) {
+#if defined(__SANITIZE_ADDRESS__)
+    GTEST_SKIP() << "the sanitizer reserves more address space than the limit leaves";
+#endif
+    const uint64_t saved = softLimit(RLIMIT_AS);
+    ASSERT_TRUE(setSoftLimit(RLIMIT_AS, addressSpaceInUse() + (1u << 20)));
+    const int32_t status = vokpkcs11_comm_server_init(id.c_str(), testCallback);
+    ASSERT_TRUE(setSoftLimit(RLIMIT_AS, saved));
+    EXPECT_EQ(14, status);
+    EXPECT_EQ("Thread create failed " + std::to_string(EAGAIN), lines().back());
+    expectVersionAnswered(start());
+}
+
+TEST(ServerTransferHelpers, RejectInvalidArguments) {
+    LogCapture log;
+    uint8_t buffer[4] = {};
+    ::testing::internal::CaptureStdout();
+    EXPECT_EQ(5, server_recv_data(-1, buffer, 4));
+    EXPECT_EQ(5, server_recv_data(0, nullptr, 4));
+    EXPECT_EQ(5, server_recv_data(0, buffer, 0));
+    EXPECT_EQ(
+        "[VOKPKCS11-COMM_SERVER]:server_recv_data() - Invalid argument\n"
+        "[VOKPKCS11-COMM_SERVER]:server_recv_data() - Invalid argument\n"
+        "[VOKPKCS11-COMM_SERVER]:server_recv_data() - Invalid argument\n",
+        ::testing::internal::GetCapturedStdout());
+    EXPECT_EQ(5, server_send_data(-1, buffer, 4));
+    EXPECT_EQ(5, server_send_data(0, nullptr, 4));
+    EXPECT_EQ(5, server_send_data(0, buffer, -1));
+    EXPECT_EQ((std::vector<std::string>{
+                  "Entry - Recv buf len:4", "Entry - Recv buf len:4", "Entry - Recv buf len:0",
+                  "Entry - send data len:4", "Invalid argument", "Entry - send data len:4",
+                  "Invalid argument", "Entry - send data len:-1", "Invalid argument"}),
+              log.texts(kServerTag));
+}
+
+std::string exchangeText(const std::string& request, int32_t* status) {
+    void* response = nullptr;
+    uint32_t length = 0;
+    *status = vokpkcs11_comm_client_execute_command(
+        request.data(), static_cast<int32_t>(request.size()), &response, &length);
+    std::string text(static_cast<const char*>(response), response ? length : 0);
+    std::free(response);
+    return text;
+}
+
+TEST_F(ServerChannelTest, IdsDifferingOnlyInTheirFirstCharacterMeet) {
+    std::string serverId = id, clientId = id;
+    serverId[0] = 'A';
+    clientId[0] = 'B';
+    startServer(serverId);
+    ASSERT_EQ(0, vokpkcs11_comm_client_init(clientId.c_str()));
+    int32_t status = -1;
+    EXPECT_EQ("ping", exchangeText("ping", &status));
+    EXPECT_EQ(0, status);
+}
+
+TEST_F(ServerChannelTest, ConcurrentExchangesAreNeverMixedUp) {
+    std::atomic<int> inCallback{0};
+    std::atomic<bool> overlapped{false};
+    commandHandler = [&](const Bytes& request, void** response, uint32_t* length) {
+        if (++inCallback > 1) overlapped = true;
+        Bytes marked = textBytes("answer to ");
+        marked.insert(marked.end(), request.begin(), request.end());
+        --inCallback;
+        return answer(marked, response, length);
+    };
+    startServer(id);
+    ASSERT_EQ(0, vokpkcs11_comm_client_init(id.c_str()));
+
+    constexpr int kThreads = 8, kRequests = 50;
+    std::atomic<int> mismatches{0};
+    std::vector<std::thread> threads;
+    for (int t = 0; t < kThreads; ++t) {
+        threads.emplace_back([&, t] {
+            for (int i = 0; i < kRequests; ++i) {
+                // Lengths differ per request, so a mix-up also shows in the sizes.
+                const std::string request = "t" + std::to_string(t) + "-" + std::to_string(i) +
+                                            std::string(static_cast<size_t>(t * 37 + i), '.');
+                int32_t status = -1;
+                if (exchangeText(request, &status) != "answer to " + request || status != 0)
+                    ++mismatches;
+            }
+        });
+    }
+    for (auto& thread : threads) thread.join();
+    EXPECT_EQ(0, mismatches.load());
+    EXPECT_FALSE(overlapped);
+}
+
+}  // namespace
+}  // namespace voktest
