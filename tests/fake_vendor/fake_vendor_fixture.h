@@ -1,0 +1,110 @@
+#ifndef VOK_TEST_FAKE_VENDOR_FIXTURE_H
+#define VOK_TEST_FAKE_VENDOR_FIXTURE_H
+
+#include <gtest/gtest.h>
+
+#include <deque>
+#include <string>
+#include <vector>
+
+#include "fake_vendor.h"
+
+namespace fakevendor {
+
+using Bytes = std::vector<CK_BYTE>;
+
+inline Bytes bytes(const std::string& s) { return Bytes(s.begin(), s.end()); }
+
+inline Bytes xorWith(const Bytes& data, const Bytes& key) {
+    Bytes out(data);
+    for (size_t i = 0; i < out.size(); ++i) out[i] ^= key[i % key.size()];
+    return out;
+}
+
+// A template whose values live as long as it does.
+class Template {
+public:
+    Template& add(CK_ATTRIBUTE_TYPE type, const void* value, CK_ULONG size) {
+        const auto* p = static_cast<const CK_BYTE*>(value);
+        values_.push_back(p ? Bytes(p, p + size) : Bytes());
+        attrs_.push_back({type, value ? values_.back().data() : nullptr, size});
+        return *this;
+    }
+    Template& ulong(CK_ATTRIBUTE_TYPE type, CK_ULONG v) { return add(type, &v, sizeof v); }
+    Template& flag(CK_ATTRIBUTE_TYPE type, bool v) {
+        const CK_BBOOL b = v ? CK_TRUE : CK_FALSE;
+        return add(type, &b, sizeof b);
+    }
+    Template& text(CK_ATTRIBUTE_TYPE type, const std::string& v) {
+        return add(type, v.data(), v.size());
+    }
+    CK_ATTRIBUTE_PTR data() { return attrs_.data(); }
+    CK_ULONG count() const { return attrs_.size(); }
+
+private:
+    std::deque<Bytes> values_;
+    std::vector<CK_ATTRIBUTE> attrs_;
+};
+
+// A fresh, initialised token with one read-write session open.
+class FakeVendorTest : public ::testing::Test {
+public:
+    const Bytes aesValue = bytes("0123456789abcdef");
+    const Bytes macValue = bytes("mac-key-material");
+    CK_FUNCTION_LIST_PTR f = fake_vendor_function_list();
+    CK_SESSION_HANDLE session = CK_INVALID_HANDLE;
+
+    void SetUp() override {
+        fake_vendor_reset();
+        ASSERT_EQ(f->C_Initialize(nullptr), CKR_OK);
+        session = open(CKF_SERIAL_SESSION | CKF_RW_SESSION);
+    }
+
+    CK_SESSION_HANDLE open(CK_FLAGS flags) {
+        CK_SESSION_HANDLE h = CK_INVALID_HANDLE;
+        EXPECT_EQ(f->C_OpenSession(FAKE_VENDOR_SLOT_ID, flags, nullptr, nullptr, &h), CKR_OK);
+        return h;
+    }
+
+    CK_OBJECT_HANDLE create(Template& t) {
+        CK_OBJECT_HANDLE h = CK_INVALID_HANDLE;
+        EXPECT_EQ(f->C_CreateObject(session, t.data(), t.count(), &h), CKR_OK);
+        return h;
+    }
+
+    CK_OBJECT_HANDLE secretKey(CK_KEY_TYPE type, const Bytes& value, bool sensitive = false) {
+        Template t;
+        t.ulong(CKA_CLASS, CKO_SECRET_KEY)
+            .ulong(CKA_KEY_TYPE, type)
+            .add(CKA_VALUE, value.data(), value.size());
+        t.flag(CKA_SENSITIVE, sensitive).text(CKA_LABEL, "label");
+        return create(t);
+    }
+    CK_OBJECT_HANDLE aesKey() { return secretKey(CKK_AES, aesValue); }
+    CK_OBJECT_HANDLE macKey() { return secretKey(CKK_GENERIC_SECRET, macValue); }
+
+    // A single-part or final call's output, taken with the two-call convention.
+    template <typename Call>
+    Bytes collect(Call call) {
+        CK_ULONG len = 0;
+        EXPECT_EQ(call(nullptr, &len), CKR_OK);
+        Bytes out(len);
+        EXPECT_EQ(call(out.data(), &len), CKR_OK);
+        out.resize(len);
+        return out;
+    }
+
+    Bytes attribute(CK_OBJECT_HANDLE object, CK_ATTRIBUTE_TYPE type) {
+        Bytes value(256);
+        CK_ATTRIBUTE a{type, value.data(), value.size()};
+        EXPECT_EQ(f->C_GetAttributeValue(session, object, &a, 1), CKR_OK);
+        value.resize(a.ulValueLen <= value.size() ? a.ulValueLen : 0);
+        return value;
+    }
+};
+
+inline CK_MECHANISM mechanism(CK_MECHANISM_TYPE type) { return {type, nullptr, 0}; }
+
+}  // namespace fakevendor
+
+#endif
