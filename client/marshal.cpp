@@ -1,0 +1,131 @@
+#include "marshal.h"
+
+#include <algorithm>
+#include <cstring>
+
+#define LOG_TAG "Vokpkcs11f"
+#include "vok_log.h"
+
+namespace vok {
+namespace client {
+
+namespace {
+
+// How many bytes may move from an answer into a caller's buffer.
+size_t boundedCopy(CK_ULONG stated, size_t arrived, CK_ULONG capacity) {
+    return static_cast<size_t>(std::min<CK_ULONG>({stated, arrived, capacity}));
+}
+
+}  // namespace
+
+std::string cString(const void* p, CK_ULONG limit) {
+    if (!p) return std::string();
+    const char* s = static_cast<const char*>(p);
+    return std::string(s, strnlen(s, static_cast<size_t>(limit)));
+}
+
+std::string bytesOf(const void* p, CK_ULONG length) {
+    if (!p || length == 0) return std::string();
+    return std::string(static_cast<const char*>(p), static_cast<size_t>(length));
+}
+
+void putTemplate(AttributeList* out, const CK_ATTRIBUTE* tmpl, CK_ULONG count) {
+    if (!tmpl) return;
+    for (CK_ULONG i = 0; i < count; ++i) {
+        pkcs11::CK_ATTRIBUTE* a = out->Add();
+        a->set_type(tmpl[i].type);
+        if (tmpl[i].pValue) {
+            a->set_pvalue(bytesOf(tmpl[i].pValue, tmpl[i].ulValueLen));
+            a->set_ulvaluelen(tmpl[i].ulValueLen);
+            VOK_LOGD("pvalue not NULL");
+        } else {
+            a->clear_pvalue();
+            a->set_ulvaluelen(0);
+            VOK_LOGD("passed pvalue is NULL");
+        }
+        if (a->has_pvalue()) VOK_LOGD("has pvalue");
+    }
+}
+
+void copyBackTemplate(const AttributeList& answer, CK_ULONG statedCount, CK_ATTRIBUTE* tmpl,
+                      CK_ULONG callerCount) {
+    if (!tmpl) return;
+    const CK_ULONG n =
+        std::min<CK_ULONG>({statedCount, static_cast<CK_ULONG>(answer.size()), callerCount});
+    for (CK_ULONG i = 0; i < n; ++i) {
+        const pkcs11::CK_ATTRIBUTE& a = answer.Get(static_cast<int>(i));
+        CK_ATTRIBUTE& mine = tmpl[i];
+        mine.type = a.type();
+        if (!mine.pValue) {
+            mine.ulValueLen = a.ulvaluelen();  // length query
+        } else if (a.has_pvalue()) {
+            memcpy(mine.pValue, a.pvalue().data(),
+                   boundedCopy(a.ulvaluelen(), a.pvalue().size(), mine.ulValueLen));
+            mine.ulValueLen = a.ulvaluelen();
+        }
+    }
+}
+
+void overwriteTemplate(const AttributeList& answer, CK_ATTRIBUTE* tmpl, CK_ULONG callerCount) {
+    if (!tmpl) return;
+    const CK_ULONG n = std::min<CK_ULONG>(static_cast<CK_ULONG>(answer.size()), callerCount);
+    for (CK_ULONG i = 0; i < n; ++i) {
+        const pkcs11::CK_ATTRIBUTE& a = answer.Get(static_cast<int>(i));
+        CK_ATTRIBUTE& mine = tmpl[i];
+        mine.type = a.type();
+        if (mine.pValue)
+            memcpy(mine.pValue, a.pvalue().data(),
+                   boundedCopy(a.ulvaluelen(), a.pvalue().size(), mine.ulValueLen));
+        mine.ulValueLen = a.ulvaluelen();
+    }
+}
+
+void putList(NumberList* out, const CK_ULONG* list, CK_ULONG count) {
+    if (!list) return;
+    for (CK_ULONG i = 0; i < count; ++i) out->Add(list[i]);
+}
+
+void copyBackList(const NumberList& answer, CK_ULONG statedCount, CK_ULONG* list, CK_ULONG capacity,
+                  CK_ULONG* pulCount) {
+    if (pulCount) *pulCount = statedCount;
+    if (!list || answer.empty()) return;
+    const CK_ULONG n =
+        std::min<CK_ULONG>({statedCount, static_cast<CK_ULONG>(answer.size()), capacity});
+    for (CK_ULONG i = 0; i < n; ++i) list[i] = answer.Get(static_cast<int>(i));
+}
+
+void putMechanism(pkcs11::CK_MECHANISM* out, const CK_MECHANISM* mechanism) {
+    if (!mechanism) return;
+    out->set_mechanism(mechanism->mechanism);
+    out->set_pparameter(bytesOf(mechanism->pParameter, mechanism->ulParameterLen));
+    out->set_ulparameterlen(mechanism->ulParameterLen);
+}
+
+CK_RV copyBackOutput(CK_RV rv, const std::string& data, CK_ULONG statedLength,
+                     const OutputBuffer& out) {
+    if (out.buffer)
+        memcpy(out.buffer, data.data(), boundedCopy(statedLength, data.size(), out.capacity()));
+    if (out.length) *out.length = statedLength;
+    if (!out.buffer && rv == CKR_BUFFER_TOO_SMALL) return CKR_OK;
+    return rv;
+}
+
+void copyIntoInput(const std::string& data, CK_BYTE* buffer, CK_ULONG length) {
+    if (buffer) memcpy(buffer, data.data(), boundedCopy(length, data.size(), length));
+}
+
+void copyPaddedText(CK_UTF8CHAR* field, size_t width, const std::string& text) {
+    memset(field, 0, width);
+    memcpy(field, text.data(), std::min(width, text.size()));
+}
+
+void copyTerminatedText(void* structure, size_t offset, size_t width, const std::string& text) {
+    if (text.size() > width) return;
+    unsigned char* at = static_cast<unsigned char*>(structure) + offset;
+    const size_t n = strnlen(text.c_str(), text.size());
+    memcpy(at, text.data(), n);
+    at[n] = 0;
+}
+
+}  // namespace client
+}  // namespace vok

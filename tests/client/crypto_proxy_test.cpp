@@ -1,0 +1,242 @@
+// Output buffers, mechanisms, and the bytes the crypto proxies write back into
+// the caller's input buffers.
+#include <gtest/gtest.h>
+
+#include <cstring>
+#include <memory>
+#include <vector>
+
+#include "proxy_calls.h"
+#include "test_service.h"
+
+namespace voktest {
+namespace {
+
+CK_BYTE gIn[4] = {'i', 'n', 0, 'x'};
+CK_MECHANISM gMechanism{CKM_AES_CBC, nullptr, 0};
+
+struct SentOutput {
+    bool present;  // the bytes field of the output pair
+    std::string bytes;
+    CK_ULONG capacity;
+};
+
+// Every proxy whose output follows the output-buffer rule: how to call it with
+// (out, outLen), where its answer goes (data in field 1, length in field 2),
+// and what its request said about the buffer.
+struct OutputProxy {
+    const char* name;
+    CK_RV (*call)(CK_BYTE* out, CK_ULONG* outLen);
+    int answerField;
+    SentOutput (*sent)(const pkcs11::Operation&);
+};
+
+// clang-format off
+#define OUTPUT_PROXY(function, answerField, request, data, length, ...)                    \
+    OutputProxy{#function,                                                                  \
+                [](CK_BYTE* out, CK_ULONG* outLen) { return function(__VA_ARGS__); },       \
+                answerField,                                                                \
+                [](const pkcs11::Operation& op) {                                           \
+                    return SentOutput{op.request().has_##data(), op.request().data(),       \
+                                      op.request().length()};                               \
+                }}
+// clang-format on
+
+const OutputProxy kOutputProxies[] = {
+    OUTPUT_PROXY(C_GetOperationState, 22, getoperationstate, poperationstate, puloperationstatelen,
+                 kSession, out, outLen),
+    OUTPUT_PROXY(C_Encrypt, 11, enc, pencrypteddata, pulencrypteddatalen, kSession, gIn, 4, out,
+                 outLen),
+    OUTPUT_PROXY(C_EncryptUpdate, 27, encryptupdate, pencryptedpart, pulencryptedpartlen, kSession,
+                 gIn, 4, out, outLen),
+    OUTPUT_PROXY(C_EncryptFinal, 28, encryptfinal, plastencryptedpart, pullastencryptedpartlen,
+                 kSession, out, outLen),
+    OUTPUT_PROXY(C_Decrypt, 12, dec, pdata, puldatalen, kSession, gIn, 4, out, outLen),
+    OUTPUT_PROXY(C_DecryptUpdate, 29, decryptupdate, ppart, pulpartlen, kSession, gIn, 4, out,
+                 outLen),
+    OUTPUT_PROXY(C_DecryptFinal, 30, decryptfinal, plastpart, pullastpartlen, kSession, out,
+                 outLen),
+    OUTPUT_PROXY(C_Digest, 18, digest, pdigest, puldigestlen, kSession, gIn, 4, out, outLen),
+    OUTPUT_PROXY(C_DigestFinal, 31, digestfinal, pdigest, puldigestlen, kSession, out, outLen),
+    OUTPUT_PROXY(C_Sign, 13, sign, psignature, pulsignaturelen, kSession, gIn, 4, out, outLen),
+    OUTPUT_PROXY(C_SignFinal, 32, signfinal, psignature, pulsignaturelen, kSession, out, outLen),
+    OUTPUT_PROXY(C_SignRecover, 33, signrecover, psignature, pulsignaturelen, kSession, gIn, 4, out,
+                 outLen),
+    OUTPUT_PROXY(C_VerifyRecover, 34, verifyrecover, pdata, puldatalen, kSession, gIn, 4, out,
+                 outLen),
+    OUTPUT_PROXY(C_DigestEncryptUpdate, 35, digestencryptupdate, pencryptedpart,
+                 pulencryptedpartlen, kSession, gIn, 4, out, outLen),
+    OUTPUT_PROXY(C_DecryptDigestUpdate, 36, decryptdigestupdate, ppart, pulpartlen, kSession, gIn,
+                 4, out, outLen),
+    OUTPUT_PROXY(C_SignEncryptUpdate, 37, signencryptupdate, pencryptedpart, pulencryptedpartlen,
+                 kSession, gIn, 4, out, outLen),
+    OUTPUT_PROXY(C_DecryptVerifyUpdate, 38, decryptverifyupdate, ppart, pulpartlen, kSession, gIn,
+                 4, out, outLen),
+    OUTPUT_PROXY(C_WrapKey, 41, wrapkey, pwrappedkey, pulwrappedkeylen, kSession, &gMechanism, kKey,
+                 kOtherKey, out, outLen),
+};
+
+const std::string kProduced("\x01\x00\x02\x03\x04\x05\x06\x07\x08\x09", 10);
+constexpr size_t kGuard = 8;
+
+class OutputBuffers : public ::testing::Test {
+protected:
+    TestService& service = TestService::start();
+
+    // A caller's buffer of `capacity` bytes, then guard bytes. Its first byte
+    // is 0, so the request carries the field present and empty.
+    static std::vector<CK_BYTE> buffer(size_t capacity) {
+        std::vector<CK_BYTE> b(capacity + kGuard, 0xa5);
+        b[0] = 0;
+        return b;
+    }
+    void script(const OutputProxy& proxy, CK_RV rv, const std::string& data, CK_ULONG length) {
+        service.scriptRaw(encodeAnswer(proxy.name, rv, proxy.answerField, {data, length}));
+    }
+    SentOutput sent(const OutputProxy& proxy) const { return proxy.sent(service.lastRequest()); }
+};
+
+TEST_F(OutputBuffers, ResultComesBackIntoTheSameBufferWithItsLength) {
+    for (const OutputProxy& proxy : kOutputProxies) {
+        SCOPED_TRACE(proxy.name);
+        std::vector<CK_BYTE> out = buffer(16), expected = out;
+        memcpy(expected.data(), kProduced.data(), kProduced.size());
+        CK_ULONG length = 16;
+        script(proxy, CKR_OK, kProduced, kProduced.size());
+        EXPECT_EQ(CKR_OK, proxy.call(out.data(), &length));
+        EXPECT_TRUE(sent(proxy).present);
+        EXPECT_EQ("", sent(proxy).bytes);
+        EXPECT_EQ(16u, sent(proxy).capacity);
+        EXPECT_EQ(expected, out);
+        EXPECT_EQ(kProduced.size(), length);
+    }
+}
+
+TEST_F(OutputBuffers, StatedLengthBeyondTheBufferNeverWritesPastIt) {
+    for (const OutputProxy& proxy : kOutputProxies) {
+        SCOPED_TRACE(proxy.name);
+        std::vector<CK_BYTE> out = buffer(4);
+        CK_ULONG length = 4;
+        script(proxy, CKR_BUFFER_TOO_SMALL, kProduced, kProduced.size());
+        EXPECT_EQ(CKR_BUFFER_TOO_SMALL, proxy.call(out.data(), &length));
+        EXPECT_EQ(kProduced.size(), length);
+        EXPECT_EQ(std::vector<CK_BYTE>(kGuard, 0xa5),
+                  std::vector<CK_BYTE>(out.begin() + 4, out.end()));
+    }
+}
+
+TEST_F(OutputBuffers, CopiesOnlyWhatArrivedWhenTheStatedLengthIsLonger) {
+    for (const OutputProxy& proxy : kOutputProxies) {
+        SCOPED_TRACE(proxy.name);
+        std::vector<CK_BYTE> out = buffer(16), expected = out;
+        memcpy(expected.data(), "abc", 3);
+        CK_ULONG length = 16;
+        script(proxy, CKR_OK, "abc", 12);
+        EXPECT_EQ(CKR_OK, proxy.call(out.data(), &length));
+        EXPECT_EQ(expected, out);
+        EXPECT_EQ(12u, length);
+    }
+}
+
+// The module's CKR_BUFFER_TOO_SMALL is the answer to the caller's question.
+TEST_F(OutputBuffers, NullBufferIsALengthQuery) {
+    const std::pair<CK_RV, CK_RV> moduleToCaller[] = {
+        {CKR_BUFFER_TOO_SMALL, CKR_OK},
+        {CKR_OK, CKR_OK},
+        {CKR_OPERATION_NOT_INITIALIZED, CKR_OPERATION_NOT_INITIALIZED}};
+    for (const OutputProxy& proxy : kOutputProxies) {
+        for (const auto& rv : moduleToCaller) {
+            SCOPED_TRACE(std::string(proxy.name) + " " + std::to_string(rv.first));
+            CK_ULONG length = 77;
+            script(proxy, rv.first, "", 10);
+            EXPECT_EQ(rv.second, proxy.call(nullptr, &length));
+            EXPECT_FALSE(sent(proxy).present);
+            EXPECT_EQ(0u, sent(proxy).capacity);
+            EXPECT_EQ(10u, length);
+        }
+    }
+}
+
+TEST_F(OutputBuffers, NullLengthPointerIsNeitherReadNorWritten) {
+    for (const OutputProxy& proxy : kOutputProxies) {
+        SCOPED_TRACE(proxy.name);
+        std::vector<CK_BYTE> out(16, 'x');
+        script(proxy, CKR_OK, kProduced, kProduced.size());
+        EXPECT_EQ(CKR_OK, proxy.call(out.data(), nullptr));
+        EXPECT_EQ(0u, sent(proxy).capacity);
+        EXPECT_EQ(std::vector<CK_BYTE>(16, 'x'), out);
+        script(proxy, CKR_OK, kProduced, kProduced.size());
+        EXPECT_EQ(CKR_OK, proxy.call(nullptr, nullptr));
+    }
+}
+
+// Without a zero byte the buffer is read only within the caller's length (an
+// exact-size heap buffer lets the sanitizer see an over-read).
+TEST_F(OutputBuffers, UnterminatedBufferIsReadWithinItsLength) {
+    for (const OutputProxy& proxy : kOutputProxies) {
+        SCOPED_TRACE(proxy.name);
+        std::unique_ptr<CK_BYTE[]> out(new CK_BYTE[4]{'w', 'x', 'y', 'z'});
+        CK_ULONG length = 4;
+        EXPECT_EQ(CKR_OK, proxy.call(out.get(), &length));
+        EXPECT_EQ("wxyz", sent(proxy).bytes);
+    }
+}
+
+class CryptoProxies : public ::testing::Test {
+protected:
+    TestService& service = TestService::start();
+};
+
+TEST_F(CryptoProxies, MechanismParameterTravelsByteForByte) {
+    CK_MECHANISM noParameter{CKM_SHA256, nullptr, 0};
+    ASSERT_EQ(CKR_OK, C_DigestInit(kSession, &noParameter));
+    EXPECT_EQ(
+        hex(encodeRequest("C_DigestInit", 18, {kSession, Field::message({CKM_SHA256, "", 0})})),
+        hex(service.lastRequestBytes()));
+
+    CK_BYTE label[] = "label";
+    CK_RSA_PKCS_OAEP_PARAMS oaep{CKM_SHA256, CKG_MGF1_SHA256, CKZ_DATA_SPECIFIED, label, 5};
+    CK_MECHANISM withParameter{CKM_RSA_PKCS_OAEP, &oaep, sizeof(oaep)};
+    ASSERT_EQ(CKR_OK, C_EncryptInit(kSession, &withParameter, kKey));
+    const std::string oaepBytes(reinterpret_cast<const char*>(&oaep), sizeof(oaep));
+    EXPECT_EQ(hex(encodeRequest(
+                  "C_EncryptInit", 14,
+                  {kSession, Field::message({CKM_RSA_PKCS_OAEP, oaepBytes, sizeof(oaep)}), kKey})),
+              hex(service.lastRequestBytes()));
+}
+
+// Signature, seed and random bytes come back into the caller's own input
+// buffer, never more than its length; random data also no more than stated.
+TEST_F(CryptoProxies, EchoedBytesStayWithinTheCallersBuffer) {
+    struct Case {
+        const char* name;
+        CK_RV (*call)(CK_BYTE* buffer);  // a 4-byte buffer
+        int answerField;                 // bytes in field 1, a length in field 2
+        bool heedsStatedLength;
+    };
+    const Case cases[] = {
+        {"C_Verify", [](CK_BYTE* b) { return C_Verify(kSession, gIn, 4, b, 4); }, 14, false},
+        {"C_SeedRandom", [](CK_BYTE* b) { return C_SeedRandom(kSession, b, 4); }, 20, false},
+        {"C_GenerateRandom", [](CK_BYTE* b) { return C_GenerateRandom(kSession, b, 4); }, 19, true},
+    };
+    const struct {
+        std::string bytes;
+        CK_ULONG stated;
+        std::string whole, asStated;  // the caller's buffer afterwards
+    } answers[] = {{"WX", 2, "WXcd", "WXcd"},
+                   {"WXYZ+overflow", 13, "WXYZ", "WXYZ"},
+                   {"WXYZ", 1, "WXYZ", "Wbcd"}};
+    for (const Case& c : cases) {
+        for (const auto& a : answers) {
+            SCOPED_TRACE(std::string(c.name) + " " + a.bytes);
+            std::vector<CK_BYTE> buffer = {'a', 'b', 'c', 'd', 0xa5, 0xa5};
+            service.scriptRaw(encodeAnswer(c.name, CKR_OK, c.answerField, {a.bytes, a.stated}));
+            EXPECT_EQ(CKR_OK, c.call(buffer.data()));
+            EXPECT_EQ((c.heedsStatedLength ? a.asStated : a.whole) + "\xa5\xa5",
+                      std::string(buffer.begin(), buffer.end()));
+        }
+    }
+}
+
+}  // namespace
+}  // namespace voktest

@@ -1,0 +1,380 @@
+// What the slot, session and object proxies copy back: information records,
+// counted lists, templates and handles.
+#include <gtest/gtest.h>
+
+#include <cstring>
+#include <memory>
+#include <vector>
+
+#include "proxy_calls.h"
+#include "test_service.h"
+
+namespace voktest {
+namespace {
+
+constexpr CK_ULONG kPattern = 0xa5a5a5a5a5a5a5a5;
+using List = std::vector<CK_ULONG>;
+
+class SlotObjectProxies : public ::testing::Test {
+protected:
+    TestService& service = TestService::start();
+    void script(const char* name, CK_RV rv, int field, const std::vector<Field>& fields) {
+        service.scriptRaw(encodeAnswer(name, rv, field, fields));
+    }
+};
+
+Field version(int major, int minor) { return Field::message({major, minor}); }
+std::string bytesOf(const void* p, size_t n) { return std::string(static_cast<const char*>(p), n); }
+
+// Full-width texts are copied with their terminator, which the later fields
+// absorb: flags rewrites the manufacturer's, the description's clears
+// libraryVersion.major. A text longer than its field leaves the field alone.
+TEST_F(SlotObjectProxies, GetInfoCopiesVersionsThenTextsAroundTheFlags) {
+    CK_INFO out;
+    memset(&out, 0xa5, sizeof(out));
+    script("C_GetInfo", CKR_OK, 3,
+           {Field::message({version(2, 40), std::string(32, 'M'), kFlags, "Library",
+                            version(0x107, 9)})});  // major cut to one byte
+    ASSERT_EQ(CKR_OK, C_GetInfo(&out));
+    EXPECT_EQ("\x02\x28", bytesOf(&out.cryptokiVersion, 2));
+    EXPECT_EQ(std::string(32, 'M'), bytesOf(out.manufacturerID, 32));
+    EXPECT_EQ(kFlags, CK_FLAGS{out.flags});  // packed: compare a copy
+    EXPECT_EQ(bytesOf("Library\0\xa5", 9), bytesOf(out.libraryDescription, 9));
+    EXPECT_EQ("\x07\x09", bytesOf(&out.libraryVersion, 2));
+
+    memset(&out, 0xa5, sizeof(out));
+    script("C_GetInfo", CKR_OK, 3,
+           {Field::message({version(2, 40), std::string(33, 'M'), kFlags, std::string(32, 'D'),
+                            version(7, 9)})});
+    ASSERT_EQ(CKR_OK, C_GetInfo(&out));
+    EXPECT_EQ(std::string(32, '\xa5'), bytesOf(out.manufacturerID, 32));
+    EXPECT_EQ(kFlags, CK_FLAGS{out.flags});  // packed: compare a copy
+    EXPECT_EQ(std::string(32, 'D'), bytesOf(out.libraryDescription, 32));
+    EXPECT_EQ(bytesOf("\0\x09", 2), bytesOf(&out.libraryVersion, 2));
+}
+
+TEST_F(SlotObjectProxies, GetSlotInfoFullWidthDescriptionClearsTheManufacturersFirstByte) {
+    CK_SLOT_INFO out;
+    memset(&out, 0xa5, sizeof(out));
+    script("C_GetSlotInfo", CKR_OK, 5,
+           {Field::message({std::string(64, 'S'), "Maker", kFlags, version(1, 2), version(3, 4)})});
+    ASSERT_EQ(CKR_OK, C_GetSlotInfo(kSlot, &out));
+    EXPECT_EQ(std::string(64, 'S'), bytesOf(out.slotDescription, 64));
+    EXPECT_EQ(bytesOf("\0aker\0\xa5", 7), bytesOf(out.manufacturerID, 7));
+    EXPECT_EQ(kFlags, CK_FLAGS{out.flags});  // packed: compare a copy
+    EXPECT_EQ("\x01\x02\x03\x04", bytesOf(&out.hardwareVersion, 4));
+}
+
+TEST_F(SlotObjectProxies, GetTokenInfoCopiesTextsToTheirWidthAndEveryCounter) {
+    CK_TOKEN_INFO out;
+    memset(&out, 0xa5, sizeof(out));
+    script("C_GetTokenInfo", CKR_OK, 16,
+           {Field::message({std::string(40, 'L'), std::string(32, 'M'), "abc", std::string(16, '7'),
+                            kFlags, 1, 2, 3, 4, 5, 6, 7, 8, 9, kKey, version(1, 2), version(3, 4),
+                            "2024"})});
+    ASSERT_EQ(CKR_OK, C_GetTokenInfo(kSlot, &out));
+    EXPECT_EQ(std::string(32, 'L'), bytesOf(out.label, 32));
+    EXPECT_EQ(std::string(32, 'M'), bytesOf(out.manufacturerID, 32));
+    EXPECT_EQ(bytesOf("abc", 3) + std::string(13, '\0'), bytesOf(out.model, 16));
+    EXPECT_EQ(std::string(16, '7'), bytesOf(out.serialNumber, 16));
+    const CK_ULONG numbers[] = {kFlags, 1, 2, 3, 4, 5, 6, 7, 8, 9, kKey};
+    EXPECT_EQ(bytesOf(numbers, sizeof(numbers)), bytesOf(&out.flags, sizeof(numbers)));
+    EXPECT_EQ("\x01\x02\x03\x04", bytesOf(&out.hardwareVersion, 4));
+    EXPECT_EQ(bytesOf("2024", 4) + std::string(12, '\0'), bytesOf(out.utcTime, 16));
+}
+
+TEST_F(SlotObjectProxies, SessionAndMechanismInfoCopyEveryField) {
+    CK_SESSION_INFO session{};
+    script("C_GetSessionInfo", CKR_OK, 15, {Field::message({kSlot, 3, kFlags, kKey})});
+    ASSERT_EQ(CKR_OK, C_GetSessionInfo(kSession, &session));
+    const CK_ULONG sessionFields[] = {kSlot, 3, kFlags, kKey};
+    EXPECT_EQ(bytesOf(sessionFields, sizeof(sessionFields)), bytesOf(&session, sizeof(session)));
+
+    CK_MECHANISM_INFO mechanism{};
+    script("C_GetMechanismInfo", CKR_OK, 17, {Field::message({128, kKey, kFlags})});
+    ASSERT_EQ(CKR_OK, C_GetMechanismInfo(kSlot, CKM_AES_CBC, &mechanism));
+    const CK_ULONG mechanismFields[] = {128, kKey, kFlags};
+    EXPECT_EQ(bytesOf(mechanismFields, sizeof(mechanismFields)),
+              bytesOf(&mechanism, sizeof(mechanism)));
+}
+
+// C_GetSlotList and C_GetMechanismList share the list rule; both answers carry
+// the list in field 1 and the count in field 2.
+TEST_F(SlotObjectProxies, ListsFollowTheTwoCallConventionWithinTheCallersList) {
+    struct ListProxy {
+        const char* name;
+        CK_RV (*call)(CK_ULONG* list, CK_ULONG* count);
+        int answerField;
+        List (*sentList)(const pkcs11::Operation&);
+        uint64_t (*sentCount)(const pkcs11::Operation&);
+    };
+    const ListProxy proxies[] = {
+        {"C_GetSlotList", [](CK_ULONG* l, CK_ULONG* n) { return C_GetSlotList(CK_TRUE, l, n); }, 4,
+         [](const pkcs11::Operation& op) {
+             return List(op.slotlist().slotidlist().begin(), op.slotlist().slotidlist().end());
+         },
+         [](const pkcs11::Operation& op) { return op.slotlist().pulcount(); }},
+        {"C_GetMechanismList",
+         [](CK_ULONG* l, CK_ULONG* n) { return C_GetMechanismList(kSlot, l, n); }, 21,
+         [](const pkcs11::Operation& op) {
+             const auto& sent = op.mechanismlist().pmechanismlist();
+             return List(sent.begin(), sent.end());
+         },
+         [](const pkcs11::Operation& op) { return op.mechanismlist().pulcount(); }},
+    };
+    for (const ListProxy& proxy : proxies) {
+        SCOPED_TRACE(proxy.name);
+        auto sentList = [&] { return proxy.sentList(service.lastRequest()); };
+        CK_ULONG count = 7;
+        script(proxy.name, CKR_OK, proxy.answerField, {Field(), 3});
+        ASSERT_EQ(CKR_OK, proxy.call(nullptr, &count));
+        EXPECT_EQ(7u, proxy.sentCount(service.lastRequest()));
+        EXPECT_TRUE(sentList().empty());
+        EXPECT_EQ(3u, count);
+
+        List list = {1, 2, 3, kPattern};  // three entries and a guard
+        script(proxy.name, CKR_OK, proxy.answerField, {Field::repeated({21, 22, 23}), 3});
+        ASSERT_EQ(CKR_OK, proxy.call(list.data(), &count));
+        EXPECT_EQ((List{1, 2, 3}), sentList());
+        EXPECT_EQ((List{21, 22, 23, kPattern}), list);
+
+        count = 2;  // more arrive than the caller holds: the needed count is reported
+        script(proxy.name, CKR_OK, proxy.answerField, {Field::repeated({31, 32, 33, 34}), 4});
+        ASSERT_EQ(CKR_OK, proxy.call(list.data(), &count));
+        EXPECT_EQ((List{31, 32, 23, kPattern}), list);
+        EXPECT_EQ(4u, count);
+
+        count = 3;  // a stated count larger than what arrived
+        script(proxy.name, CKR_OK, proxy.answerField, {Field::repeated({41}), 3});
+        ASSERT_EQ(CKR_OK, proxy.call(list.data(), &count));
+        EXPECT_EQ((List{41, 32, 23, kPattern}), list);
+        EXPECT_EQ(3u, count);
+
+        script(proxy.name, CKR_OK, proxy.answerField, {Field::repeated({51, 52}), 2});
+        ASSERT_EQ(CKR_OK, proxy.call(list.data(), nullptr));
+        EXPECT_EQ(0u, proxy.sentCount(service.lastRequest()));
+        EXPECT_EQ((List{41, 32, 23, kPattern}), list);
+    }
+}
+
+// C_GetAttributeValue and C_SetAttributeValue share the template copy-back.
+TEST_F(SlotObjectProxies, TemplateCopyBackStaysWithinTheCallersBuffersAndCount) {
+    struct TemplateProxy {
+        const char* name;
+        CK_RV (*call)(CK_ATTRIBUTE* tmpl, CK_ULONG count);
+        int answerField;  // the answer holds the template, then the count
+    };
+    const TemplateProxy proxies[] = {
+        {"C_GetAttributeValue",
+         [](CK_ATTRIBUTE* t, CK_ULONG n) { return C_GetAttributeValue(kSession, kObject, t, n); },
+         7},
+        {"C_SetAttributeValue",
+         [](CK_ATTRIBUTE* t, CK_ULONG n) { return C_SetAttributeValue(kSession, kObject, t, n); },
+         26},
+    };
+    const Field answered = Field::attributes({{CKA_MODULUS_BITS, Field(), 300},  // length query
+                                              {CKA_TOKEN, "0123456789", 10},  // beyond the buffer
+                                              {CKA_KEY_TYPE, Field(), 5},     // no value: kept
+                                              {CKA_ID, "x", 1}});
+    for (const TemplateProxy& proxy : proxies) {
+        SCOPED_TRACE(proxy.name);
+        char small[4 + 4], kept[8] = "kept";  // `small` holds 4 bytes, then a guard
+        memcpy(small, "....####", 8);
+        alignas(8) CK_ATTRIBUTE tmpl[4] = {{CKA_VALUE, nullptr, 0},
+                                           {CKA_LABEL, small, 4},
+                                           {CKA_LABEL, kept, 8},
+                                           {CKA_CLASS, nullptr, 99}};  // beyond the caller's count
+        script(proxy.name, CKR_ATTRIBUTE_SENSITIVE, proxy.answerField, {answered, 4});
+        ASSERT_EQ(CKR_ATTRIBUTE_SENSITIVE, proxy.call(tmpl, 3));
+        EXPECT_EQ(CKA_MODULUS_BITS, tmpl[0].type);
+        EXPECT_EQ(300u, tmpl[0].ulValueLen);
+        EXPECT_EQ(CKA_TOKEN, tmpl[1].type);
+        EXPECT_EQ("0123####", std::string(small, 8));
+        EXPECT_EQ(10u, tmpl[1].ulValueLen);
+        EXPECT_EQ(CKA_KEY_TYPE, tmpl[2].type);
+        EXPECT_EQ(8u, tmpl[2].ulValueLen);
+        EXPECT_STREQ("kept", kept);
+        EXPECT_EQ(CKA_CLASS, tmpl[3].type);
+        EXPECT_EQ(99u, tmpl[3].ulValueLen);
+
+        tmpl[1] = CK_ATTRIBUTE{CKA_LABEL, small, 4};  // the stated count limits the copy
+        script(proxy.name, CKR_OK, proxy.answerField, {answered, 1});
+        ASSERT_EQ(CKR_OK, proxy.call(tmpl, 3));
+        EXPECT_EQ(CKA_LABEL, tmpl[1].type);
+    }
+}
+
+TEST_F(SlotObjectProxies, FindObjectsInitRewritesTheTemplateWhetherOrNotAValueCame) {
+    char value[4 + 4];
+    memcpy(value, "....####", 8);
+    alignas(8) CK_ATTRIBUTE tmpl[3] = {
+        {CKA_LABEL, value, 4}, {CKA_CLASS, nullptr, 8}, {CKA_ID, nullptr, 9}};
+    script("C_FindObjectsInit", CKR_OK, 8,
+           {Field::attributes(
+               {{CKA_VALUE, "0123456789", 10}, {CKA_TOKEN, Field(), 1}, {CKA_KEY_TYPE, "k", 1}})});
+    ASSERT_EQ(CKR_OK, C_FindObjectsInit(kSession, tmpl, 2));
+    EXPECT_EQ(CKA_VALUE, tmpl[0].type);
+    EXPECT_EQ("0123####", std::string(value, 8));
+    EXPECT_EQ(10u, tmpl[0].ulValueLen);
+    EXPECT_EQ(CKA_TOKEN, tmpl[1].type);
+    EXPECT_EQ(nullptr, tmpl[1].pValue);
+    EXPECT_EQ(1u, tmpl[1].ulValueLen);
+    EXPECT_EQ(CKA_ID, tmpl[2].type);
+}
+
+TEST_F(SlotObjectProxies, FindObjectsCopiesNoMoreHandlesThanTheCallerAllows) {
+    List handles(4, kPattern);
+    CK_ULONG found = 0;
+    script("C_FindObjects", CKR_OK, 9, {Field::repeated({1, 2, 3, 4, 5}), 5});
+    ASSERT_EQ(CKR_OK, C_FindObjects(kSession, handles.data(), 3, &found));
+    EXPECT_EQ((List{1, 2, 3, kPattern}), handles);
+    EXPECT_EQ(5u, found);
+
+    script("C_FindObjects", CKR_OK, 9, {Field::repeated({9}), 2});  // more stated than arrived
+    ASSERT_EQ(CKR_OK, C_FindObjects(kSession, handles.data(), 3, &found));
+    EXPECT_EQ((List{9, 2, 3, kPattern}), handles);
+    EXPECT_EQ(2u, found);
+}
+
+TEST_F(SlotObjectProxies, HandlesComeBackFromTheirOwnFields) {
+    CK_OBJECT_HANDLE handle = 0, other = 0;
+    script("C_CreateObject", CKR_OK, 23, {Field::repeated({kObject, kKey})});
+    ASSERT_EQ(CKR_OK, C_CreateObject(kSession, nullptr, 0, &handle));
+    EXPECT_EQ(kObject, handle);
+    script("C_CopyObject", CKR_OK, 24, {});  // present, without a handle
+    ASSERT_EQ(CKR_OK, C_CopyObject(kSession, kObject, nullptr, 0, &handle));
+    EXPECT_EQ(kObject, handle);
+    script("C_CopyObject", CKR_OK, 24, {Field::repeated({kOtherKey})});
+    ASSERT_EQ(CKR_OK, C_CopyObject(kSession, kObject, nullptr, 0, &handle));
+    EXPECT_EQ(kOtherKey, handle);
+    script("C_OpenSession", CKR_OK, 6, {kSession});
+    ASSERT_EQ(CKR_OK, C_OpenSession(kSlot, kFlags, nullptr, nullptr, &handle));
+    EXPECT_EQ(kSession, handle);
+    script("C_GetObjectSize", CKR_OK, 25, {kKey});
+    ASSERT_EQ(CKR_OK, C_GetObjectSize(kSession, kObject, &handle));
+    EXPECT_EQ(kKey, handle);
+    script("C_GenerateKey", CKR_OK, 39, {kKey});
+    ASSERT_EQ(CKR_OK, C_GenerateKey(kSession, nullptr, nullptr, 0, &handle));
+    EXPECT_EQ(kKey, handle);
+    script("C_GenerateKeyPair", CKR_OK, 40, {kKey, kOtherKey});
+    ASSERT_EQ(CKR_OK,
+              C_GenerateKeyPair(kSession, nullptr, nullptr, 0, nullptr, 0, &handle, &other));
+    EXPECT_EQ(kKey, handle);
+    EXPECT_EQ(kOtherKey, other);
+    script("C_UnWrapKey", CKR_OK, 42, {kObject});
+    ASSERT_EQ(CKR_OK, C_UnwrapKey(kSession, nullptr, kKey, nullptr, 0, nullptr, 0, &handle));
+    EXPECT_EQ(kObject, handle);
+    // Deployed services answer C_DeriveKey under another name; the answer still counts.
+    script("C_UnDeriveKey", CKR_KEY_SIZE_RANGE, 43, {kOtherKey});
+    ASSERT_EQ(CKR_KEY_SIZE_RANGE, C_DeriveKey(kSession, nullptr, kKey, nullptr, 0, &handle));
+    EXPECT_EQ(kOtherKey, handle);
+    script("C_WaitForSlotEvent", CKR_OK, 44, {kSlot});
+    ASSERT_EQ(CKR_OK, C_WaitForSlotEvent(kFlags, &handle, nullptr));
+    EXPECT_EQ(kSlot, handle);
+}
+
+// Texts are read only within the caller's stated length (exact-size heap
+// buffers let the sanitizer see an over-read); a NULL PIN sends none.
+TEST_F(SlotObjectProxies, PinsAndLabelsAreReadWithinTheirLength) {
+    std::unique_ptr<CK_UTF8CHAR[]> pin(new CK_UTF8CHAR[4]{'9', '8', '7', '6'});
+    std::unique_ptr<CK_UTF8CHAR[]> label(new CK_UTF8CHAR[32]);
+    memset(label.get(), 'T', 32);
+    ASSERT_EQ(CKR_OK, C_Login(kSession, CKU_USER, pin.get(), 4));
+    EXPECT_EQ("9876", service.lastRequest().login().ppin());
+    ASSERT_EQ(CKR_OK, C_InitToken(kSlot, pin.get(), 4, label.get()));
+    EXPECT_EQ(std::string(32, 'T'), service.lastRequest().inittoken().plabel());
+    ASSERT_EQ(CKR_OK, C_SetPIN(kSession, pin.get(), 2, pin.get(), 4));
+    EXPECT_EQ("98", service.lastRequest().setpin().poldpin());
+    EXPECT_EQ("9876", service.lastRequest().setpin().pnewpin());
+    ASSERT_EQ(CKR_OK, C_Login(kSession, CKU_USER, nullptr, 0));  // protected authentication path
+    EXPECT_FALSE(service.lastRequest().login().has_ppin());
+}
+
+// Answers that carry their response message, to callers that passed NULL
+// where the proxy would store it.
+TEST_F(SlotObjectProxies, NullOutputPointersAreNotDereferenced) {
+    struct Case {
+        const char* name;
+        CK_RV (*call)();
+        int field;
+        std::vector<Field> fields;
+    };
+    const Field empty = Field::message({});
+    const Case cases[] = {
+        {"C_GetInfo", [] { return C_GetInfo(nullptr); }, 3, {empty}},
+        {"C_GetSlotInfo", [] { return C_GetSlotInfo(kSlot, nullptr); }, 5, {empty}},
+        {"C_GetTokenInfo", [] { return C_GetTokenInfo(kSlot, nullptr); }, 16, {empty}},
+        {"C_GetSessionInfo", [] { return C_GetSessionInfo(kSession, nullptr); }, 15, {empty}},
+        {"C_GetMechanismInfo", [] { return C_GetMechanismInfo(kSlot, 0, nullptr); }, 17, {empty}},
+        {"C_GetSlotList",
+         [] { return C_GetSlotList(CK_FALSE, nullptr, nullptr); },
+         4,
+         {Field::repeated({1}), 1}},
+        {"C_GetMechanismList",
+         [] { return C_GetMechanismList(kSlot, nullptr, nullptr); },
+         21,
+         {Field::repeated({1}), 1}},
+        {"C_OpenSession",
+         [] { return C_OpenSession(kSlot, 0, nullptr, nullptr, nullptr); },
+         6,
+         {1}},
+        {"C_GetObjectSize", [] { return C_GetObjectSize(kSession, kObject, nullptr); }, 25, {1}},
+        {"C_GetAttributeValue",
+         [] { return C_GetAttributeValue(kSession, 0, nullptr, 2); },
+         7,
+         {Field::attributes({{CKA_ID, "x", 1}}), 1}},
+        {"C_FindObjectsInit",
+         [] { return C_FindObjectsInit(kSession, nullptr, 2); },
+         8,
+         {Field::attributes({{CKA_ID, "x", 1}})}},
+        {"C_FindObjects",
+         [] { return C_FindObjects(kSession, nullptr, 4, nullptr); },
+         9,
+         {Field::repeated({1}), 1}},
+        {"C_CreateObject",
+         [] { return C_CreateObject(kSession, nullptr, 0, nullptr); },
+         23,
+         {Field::repeated({1})}},
+        {"C_CopyObject",
+         [] { return C_CopyObject(kSession, kObject, nullptr, 0, nullptr); },
+         24,
+         {Field::repeated({1})}},
+        {"C_GenerateKey",
+         [] { return C_GenerateKey(kSession, nullptr, nullptr, 0, nullptr); },
+         39,
+         {1}},
+        {"C_GenerateKeyPair",
+         [] {
+             return C_GenerateKeyPair(kSession, nullptr, nullptr, 0, nullptr, 0, nullptr, nullptr);
+         },
+         40,
+         {1, 2}},
+        {"C_UnWrapKey",
+         [] { return C_UnwrapKey(kSession, nullptr, kKey, nullptr, 0, nullptr, 0, nullptr); },
+         42,
+         {1}},
+        {"C_DeriveKey",
+         [] { return C_DeriveKey(kSession, nullptr, kKey, nullptr, 0, nullptr); },
+         43,
+         {1}},
+        {"C_Verify", [] { return C_Verify(kSession, nullptr, 0, nullptr, 4); }, 14, {"sig", 3}},
+        {"C_SeedRandom", [] { return C_SeedRandom(kSession, nullptr, 4); }, 20, {"seed", 4}},
+        {"C_GenerateRandom",
+         [] { return C_GenerateRandom(kSession, nullptr, 4); },
+         19,
+         {"rand", 4}},
+        {"C_WaitForSlotEvent",
+         [] { return C_WaitForSlotEvent(kFlags, nullptr, nullptr); },
+         44,
+         {kSlot}},
+    };
+    for (const Case& c : cases) {
+        SCOPED_TRACE(c.name);
+        script(c.name, CKR_DEVICE_ERROR, c.field, c.fields);
+        EXPECT_EQ(CKR_DEVICE_ERROR, c.call());
+        EXPECT_EQ(c.name, service.lastRequest().name());
+    }
+}
+
+}  // namespace
+}  // namespace voktest
