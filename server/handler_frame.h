@@ -1,0 +1,41 @@
+#ifndef VOK_SERVER_HANDLER_FRAME_H
+#define VOK_SERVER_HANDLER_FRAME_H
+
+// The steps every handler shares: parse the command into `operation`, answer
+// nothing without a module, let the body call the module and fill the answer,
+// set `result`, serialise.
+
+#include <string>
+
+#include "vok_server.h"
+
+namespace vok {
+namespace server {
+
+// The serialised answer, or an empty one when it could not be framed.
+std::string serialised(const pkcs11::OperationResult& response);
+
+// body(pkcs11::OperationResult&) reads the request sub-message from
+// `operation`, stores the module's return value in `rv` and fills the answer's
+// sub-message whatever `rv` is. Whatever it throws (in practice sizes from the
+// request that cannot be allocated) ends in the empty answer, the one the
+// client also gets for a command nobody serves.
+template <class Body>
+std::string serve(const std::string& request, const char* responseName, Body&& body) noexcept {
+    try {
+        operation.ParseFromString(request);
+        if (ckpFunctions == nullptr) return std::string();
+        pkcs11::OperationResult response;
+        response.set_name(responseName);
+        body(response);
+        response.set_result(rv);
+        return serialised(response);
+    } catch (...) {
+        return std::string();
+    }
+}
+
+}  // namespace server
+}  // namespace vok
+
+#endif

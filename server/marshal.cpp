@@ -1,0 +1,193 @@
+#include "marshal.h"
+
+#include <algorithm>
+#include <cstddef>
+
+#define LOG_TAG "Vokpkcs11f_Server"
+#include "vok_log.h"
+
+namespace vok {
+namespace server {
+
+namespace {
+
+// PKCS#11 labels are blank-padded, never zero-terminated.
+constexpr CK_UTF8CHAR kBlank = ' ';
+
+// Text that starts at `member` and runs on up to the first zero byte, but not
+// past the end of the structure.
+template <class S>
+std::string runOnText(const S& structure, const void* member) {
+    const char* begin = reinterpret_cast<const char*>(&structure);
+    const char* at = static_cast<const char*>(member);
+    const size_t room = sizeof(S) - static_cast<size_t>(at - begin);
+    return std::string(at, strnlen(at, room));
+}
+
+void putVersion(pkcs11::CK_VERSION* out, const CK_VERSION& in) {
+    out->set_vermajor(in.major);
+    out->set_verminor(in.minor);
+}
+
+}  // namespace
+
+Bytes fromRequest(const std::string& sent, uint64_t length) {
+    Bytes buffer(length);
+    memcpy(buffer.data(), sent.data(),
+           static_cast<size_t>(std::min<uint64_t>(length, sent.size())));
+    return buffer;
+}
+
+std::string leading(const Bytes& buffer, CK_ULONG length) {
+    const uint64_t n = std::min<uint64_t>(length, buffer.count());
+    return std::string(reinterpret_cast<const char*>(buffer.data()), static_cast<size_t>(n));
+}
+
+std::array<CK_UTF8CHAR, 32> paddedLabel(const std::string& sent) {
+    std::array<CK_UTF8CHAR, 32> label;
+    label.fill(kBlank);
+    memcpy(label.data(), sent.data(), std::min(label.size(), sent.size()));
+    return label;
+}
+
+CountedList::CountedList(bool requestPresent, const NumberList& sent, CK_ULONG count,
+                         const ListTexts& texts)
+    : texts_(texts), count_(count) {
+    VOK_LOGD("ckpFunctions not null");
+    if (requestPresent) VOK_LOGD("Already present");
+    if (sent.empty())
+        VOK_LOGD("%s", texts_.lengthQuery);
+    else
+        entries_.emplace(count);
+}
+
+CK_ULONG CountedList::answer(NumberList* out) const {
+    VOK_LOGD("reached here");
+    VOK_LOGD("%s", texts_.created);
+    if (!entries_) {
+        VOK_LOGD("%s", texts_.noList);
+        return count_;
+    }
+    const uint64_t n = std::min<uint64_t>(count_, entries_->count());
+    for (uint64_t i = 0; i < n; ++i) {
+        VOK_LOGD("inside for");
+        out->Add(entries_->data()[i]);
+    }
+    return count_;
+}
+
+void appendNumbers(NumberList* out, const CK_ULONG* values, uint64_t n) {
+    out->Reserve(static_cast<int>(n));
+    for (uint64_t i = 0; i < n; ++i) out->Add(values[i]);
+}
+
+NativeTemplate::NativeTemplate(const AttributeList& sent, CK_ULONG count, TemplateRule rule)
+    : attributes_(count) {
+    const int n = static_cast<int>(std::min<uint64_t>(count, sent.size()));
+    auto hasValue = [&](const pkcs11::CK_ATTRIBUTE& a) {
+        return a.has_pvalue() || rule.alwaysCopyValue;
+    };
+    // All values together must fit a frame as well; checked before any is
+    // allocated.
+    uint64_t valueBytes = 0;
+    for (int i = 0; i < n; ++i) {
+        const pkcs11::CK_ATTRIBUTE& a = sent.Get(i);
+        if (!hasValue(a)) continue;
+        if (a.ulvaluelen() > kFrameLimit - valueBytes) throw std::bad_alloc();
+        valueBytes += a.ulvaluelen();
+    }
+    values_.resize(static_cast<size_t>(n));
+    for (int i = 0; i < n; ++i) {
+        const pkcs11::CK_ATTRIBUTE& a = sent.Get(i);
+        CK_ATTRIBUTE& native = attributes_.data()[i];
+        VOK_LOGD("Inside for");
+        native.type = a.type();
+        VOK_LOGD("attr_type set");
+        if (hasValue(a)) {
+            if (a.has_pvalue()) VOK_LOGD("Inside if not NULL pdata");
+            native.pValue = values_[i].emplace(fromRequest(a.pvalue(), a.ulvaluelen())).data();
+        }
+        native.ulValueLen = a.ulvaluelen();
+        if (rule.logValueLength) VOK_LOGD("attr_ulvaluelen set");
+    }
+}
+
+void NativeTemplate::echo(AttributeList* out, Echo rule) const {
+    for (uint64_t i = 0; i < count(); ++i) {
+        const CK_ATTRIBUTE& native = attributes_.data()[i];
+        // The service's own record of the value buffer, not the pointer in the
+        // template, which the module could have changed.
+        const Bytes* value = i < values_.size() && values_[i] ? &*values_[i] : nullptr;
+        pkcs11::CK_ATTRIBUTE* a = out->Add();
+        a->set_type(native.type);
+        if (!value) {
+            a->set_ulvaluelen(native.ulValueLen);  // a length query's answer
+            continue;
+        }
+        VOK_LOGD("Inside response of if not null");
+        if (native.ulValueLen == CK_UNAVAILABLE_INFORMATION && rule != Echo::kVerbatim) {
+            if (rule == Echo::kDropUnavailableLogged) VOK_LOGD("Inside ulvaluelen is -1");
+            continue;
+        }
+        a->set_pvalue(leading(*value, native.ulValueLen));
+        a->set_ulvaluelen(native.ulValueLen);
+    }
+}
+
+void putInfo(pkcs11::CK_INFO* out, const CK_INFO& in) {
+    VOK_LOGD("C_GetInfo reached here");
+    pkcs11::CK_VERSION* cryptoki = out->mutable_cryptokiversion();
+    cryptoki->set_vermajor(in.cryptokiVersion.major);
+    VOK_LOGD("C_GetInfo set major");
+    cryptoki->set_verminor(in.cryptokiVersion.minor);
+    VOK_LOGD("C_GetInfo set minor");
+    out->set_manufacturerid(runOnText(in, in.manufacturerID));
+    out->set_flags(in.flags);
+    out->set_librarydescription(runOnText(in, in.libraryDescription));
+    putVersion(out->mutable_libraryversion(), in.libraryVersion);
+}
+
+void putSlotInfo(pkcs11::CK_SLOT_INFO* out, const CK_SLOT_INFO& in) {
+    out->set_slotdescription(runOnText(in, in.slotDescription));
+    out->set_manufacturerid(runOnText(in, in.manufacturerID));
+    out->set_flags(in.flags);
+    putVersion(out->mutable_hardwareversion(), in.hardwareVersion);
+    putVersion(out->mutable_firmwareversion(), in.firmwareVersion);
+}
+
+void putTokenInfo(pkcs11::CK_TOKEN_INFO* out, const CK_TOKEN_INFO& in) {
+    out->set_label(runOnText(in, in.label));
+    out->set_manufacturerid(runOnText(in, in.manufacturerID));
+    out->set_model(runOnText(in, in.model));
+    out->set_serialnumber(runOnText(in, in.serialNumber));
+    out->set_flags(in.flags);
+    out->set_ulmaxsessioncount(in.ulMaxSessionCount);
+    out->set_ulsessioncount(in.ulSessionCount);
+    out->set_ulmaxrwsessioncount(in.ulMaxRwSessionCount);
+    out->set_ulrwsessioncount(in.ulRwSessionCount);
+    out->set_ulmaxpinlen(in.ulMaxPinLen);
+    out->set_ulminpinlen(in.ulMinPinLen);
+    out->set_ultotalpublicmemory(in.ulTotalPublicMemory);
+    out->set_ulfreepublicmemory(in.ulFreePublicMemory);
+    out->set_ultotalprivatememory(in.ulTotalPrivateMemory);
+    out->set_ulfreeprivatememory(in.ulFreePrivateMemory);
+    putVersion(out->mutable_hardwareversion(), in.hardwareVersion);
+    putVersion(out->mutable_firmwareversion(), in.firmwareVersion);
+    out->set_utctime(runOnText(in, in.utcTime));
+}
+
+void putSessionInfo(pkcs11::CK_SESSION_INFO* out, const CK_SESSION_INFO& in) {
+    out->set_slotid(in.slotID);
+    out->set_state(in.state);
+    out->set_flags(in.flags);
+    out->set_uldeviceerror(in.ulDeviceError);
+}
+
+void putMechanismInfo(pkcs11::CK_MECHANISM_INFO* out, const CK_MECHANISM_INFO& in) {
+    out->set_ulminkeysize(in.ulMinKeySize);
+    out->set_ulmaxkeysize(in.ulMaxKeySize);
+    out->set_flags(in.flags);
+}
+
+}  // namespace server
+}  // namespace vok

@@ -1,0 +1,151 @@
+#ifndef VOK_SERVER_MARSHAL_H
+#define VOK_SERVER_MARSHAL_H
+
+// The marshalling rules shared by the handlers. Every size the module sees
+// comes from the request, but nothing is read beyond what arrived: a value or
+// list shorter than its stated size is filled as far as it goes and the rest
+// stays zero. Nothing is read from a module's buffer beyond what was
+// allocated for it.
+
+#include <array>
+#include <cstdint>
+#include <cstdlib>
+#include <cstring>
+#include <memory>
+#include <new>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "vok_pkcs11.h"
+#include "vok_proto.h"
+
+namespace vok {
+namespace server {
+
+// The largest payload a frame can carry. No single buffer, list or template
+// built for one request may exceed it, so a peer's count cannot make the
+// service allocate more than one frame's worth for it.
+constexpr uint64_t kFrameLimit = INT32_MAX;
+
+// Lists and templates of real PKCS#11 calls hold a handful of entries. A count
+// beyond this bound can only be a peer making the service allocate, and echo,
+// gigabytes from a few request bytes; it gets the empty answer.
+constexpr uint64_t kMaxElements = 1u << 20;
+
+using AttributeList = google::protobuf::RepeatedPtrField<pkcs11::CK_ATTRIBUTE>;
+using NumberList = google::protobuf::RepeatedField<google::protobuf::uint64>;
+
+struct FreeDeleter {
+    void operator()(void* p) const noexcept { std::free(p); }
+};
+
+// `count` zero-filled elements from malloc. Never NULL, even for 0: the module
+// always receives a real pointer. A count beyond a frame's worth of bytes, or
+// memory that is not there, throws std::bad_alloc, which the handler frame
+// turns into the empty answer.
+template <class T>
+class Buffer {
+public:
+    explicit Buffer(uint64_t count) : count_(count) {
+        const uint64_t limit = sizeof(T) == 1 ? kFrameLimit : kMaxElements;
+        if (count > limit) throw std::bad_alloc();
+        data_.reset(
+            static_cast<T*>(std::calloc(count ? static_cast<size_t>(count) : 1, sizeof(T))));
+        if (!data_) throw std::bad_alloc();
+    }
+    T* data() const { return data_.get(); }
+    uint64_t count() const { return count_; }
+
+private:
+    std::unique_ptr<T, FreeDeleter> data_;
+    uint64_t count_;
+};
+
+using Bytes = Buffer<CK_BYTE>;
+
+// Bounded copy from the request: `length` bytes, the first of them taken from
+// `sent` (never more than arrived), the rest zero. PINs take this rule too, so
+// the module may read the full stated length from memory the service owns.
+Bytes fromRequest(const std::string& sent, uint64_t length);
+
+// The first `length` bytes of a buffer the module filled, never more than
+// were allocated.
+std::string leading(const Bytes& buffer, CK_ULONG length);
+
+// The 32-byte token label: what arrived, blank-padded as PKCS#11 pads labels.
+std::array<CK_UTF8CHAR, 32> paddedLabel(const std::string& sent);
+
+// Counted output list (C_GetSlotList, C_GetMechanismList). An empty list in
+// the request is a pure length query (the module gets NULL); otherwise the
+// module gets `count` entries to fill, whatever the request's entries hold.
+struct ListTexts {
+    const char* lengthQuery;  // "slotidlist is 0"
+    const char* created;      // "slotlist res created"
+    const char* noList;       // "Slot list ptr NULL"
+};
+
+class CountedList {
+public:
+    CountedList(bool requestPresent, const NumberList& sent, CK_ULONG count,
+                const ListTexts& texts);
+    CK_ULONG_PTR list() { return entries_ ? entries_->data() : nullptr; }
+    CK_ULONG_PTR count() { return &count_; }
+    // Appends the entries the module reported (never more than were
+    // allocated) and returns the count as the module left it.
+    CK_ULONG answer(NumberList* out) const;
+
+private:
+    const ListTexts& texts_;
+    std::optional<Buffer<CK_ULONG>> entries_;
+    CK_ULONG count_;
+};
+
+// The handles a module wrote, in order.
+void appendNumbers(NumberList* out, const CK_ULONG* values, uint64_t n);
+
+// Template rebuild. `count` native attributes, zero-filled; the sent entries
+// give type, length and (where the rule says so) a value buffer of exactly
+// ulValueLen bytes. Entries beyond the sent list stay zero.
+struct TemplateRule {
+    bool alwaysCopyValue;  // C_FindObjectsInit: a value buffer even without pValue
+    bool logValueLength;   // "attr_ulvaluelen set"; C_GetAttributeValue does not log it
+};
+constexpr TemplateRule kInputTemplate{false, true};
+constexpr TemplateRule kQueryTemplate{false, false};
+constexpr TemplateRule kSearchTemplate{true, true};
+
+// Template echo: how a value the module reported unavailable (-1) travels.
+enum class Echo {
+    kDropUnavailable,        // neither value nor length: the client reads 0
+    kDropUnavailableLogged,  // the same, logged ("Inside ulvaluelen is -1")
+    kVerbatim,               // value and length as they stand, no -1 test
+};
+
+class NativeTemplate {
+public:
+    NativeTemplate(const AttributeList& sent, CK_ULONG count, TemplateRule rule);
+    CK_ATTRIBUTE_PTR data() const { return attributes_.data(); }
+    CK_ULONG count() const { return attributes_.count(); }
+    // One message per native attribute, in order; values from the service's
+    // own buffers, never more than were allocated.
+    void echo(AttributeList* out, Echo rule) const;
+
+private:
+    Buffer<CK_ATTRIBUTE> attributes_;
+    std::vector<std::optional<Bytes>> values_;  // one per sent entry
+};
+
+// Info structures, member by member. Each text member is read as a C string
+// that may run on into the following members up to the first zero byte; it
+// stops at the end of the structure.
+void putInfo(pkcs11::CK_INFO* out, const CK_INFO& in);
+void putSlotInfo(pkcs11::CK_SLOT_INFO* out, const CK_SLOT_INFO& in);
+void putTokenInfo(pkcs11::CK_TOKEN_INFO* out, const CK_TOKEN_INFO& in);
+void putSessionInfo(pkcs11::CK_SESSION_INFO* out, const CK_SESSION_INFO& in);
+void putMechanismInfo(pkcs11::CK_MECHANISM_INFO* out, const CK_MECHANISM_INFO& in);
+
+}  // namespace server
+}  // namespace vok
+
+#endif

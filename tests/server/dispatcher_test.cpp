@@ -1,0 +1,272 @@
+// The dispatcher with the module looked up in the real registry (embedded
+// Java VM), and what it makes of requests no proxy would send.
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <cstdint>
+#include <cstdlib>
+#include <memory>
+#include <ostream>
+#include <random>
+#include <string>
+#include <vector>
+
+#include "jvm_fixture.h"
+#include "log_capture.h"
+#include "server_test_support.h"
+
+namespace {
+
+using namespace servertest;
+using ::testing::ElementsAre;
+
+const char* const kModuleName = "vok-dispatch-test";
+
+class Dispatcher : public voktest::JvmTest {
+protected:
+    void SetUp() override {
+        JvmTest::SetUp();
+        fake_vendor_reset();
+        voktest::registerModule(kModuleName, fake_vendor_function_list());
+        setModuleName_Server(kModuleName);
+    }
+
+    // Released with delete[], as the channel does.
+    static std::string dispatch(const std::string& request) {
+        void* response = nullptr;
+        uint32_t length = 0;
+        EXPECT_EQ(0, Generate_Operation_Result_Server(
+                         request.data(), static_cast<int32_t>(request.size()), &response, &length));
+        std::unique_ptr<uint8_t[]> owned(static_cast<uint8_t*>(response));
+        return owned ? std::string(reinterpret_cast<const char*>(owned.get()), length)
+                     : std::string();
+    }
+};
+
+struct Route {
+    std::string sent;
+    const char* answeredAs;  // nullptr: the empty answer
+};
+
+void PrintTo(const Route& r, std::ostream* os) { *os << '"' << r.sent << '"'; }
+
+class Routing : public Dispatcher, public ::testing::WithParamInterface<Route> {};
+
+TEST_P(Routing, ByExactName) {
+    voktest::LogCapture log;
+    const std::string answer = dispatch(requestBytes(GetParam().sent));
+    const std::vector<std::string> lines = log.texts("Vokpkcs11f_Server");
+    if (!GetParam().answeredAs) {
+        EXPECT_EQ("", answer);
+        EXPECT_EQ(0u, fake_vendor_call_count());
+        EXPECT_THAT(lines, ::testing::Not(::testing::Contains(
+                               ::testing::StartsWith("Generate_Operation_Result"))));
+        return;
+    }
+    EXPECT_EQ(GetParam().answeredAs, parsed(answer).name());
+    ASSERT_FALSE(lines.empty());
+    EXPECT_EQ(std::string("Generate_Operation_Result ") + GetParam().answeredAs, lines.front());
+}
+
+std::vector<Route> routes() {
+    std::vector<Route> r = {
+        {"C_InitPIN", nullptr},
+        {"C_SetPIN", nullptr},
+        {"C_GetFunctionList", nullptr},
+        {"", nullptr},
+        {"c_getinfo", nullptr},
+        {"C_GetInfo ", nullptr},
+        {std::string("C_GetInfo\0tail", 14), "C_GetInfo"},
+    };
+    for (const char* name : {"C_Initialize",
+                             "C_Finalize",
+                             "C_OpenSession",
+                             "C_CloseSession",
+                             "C_Login",
+                             "C_Logout",
+                             "C_GetInfo",
+                             "C_GetSlotList",
+                             "C_GetSlotInfo",
+                             "C_GetTokenInfo",
+                             "C_GetMechanismInfo",
+                             "C_GetSessionInfo",
+                             "C_DestroyObject",
+                             "C_GetAttributeValue",
+                             "C_FindObjectsInit",
+                             "C_FindObjects",
+                             "C_FindObjectsFinal",
+                             "C_GetMechanismList",
+                             "C_InitToken",
+                             "C_InitPin",
+                             "C_SetPin",
+                             "C_CloseAllSessions",
+                             "C_GetOperationState",
+                             "C_SetOperationState",
+                             "C_CreateObject",
+                             "C_CopyObject",
+                             "C_GetObjectSize",
+                             "C_SetAttributeValue"})
+        r.push_back({name, name});
+    return r;
+}
+
+INSTANTIATE_TEST_SUITE_P(Dispatcher, Routing, ::testing::ValuesIn(routes()), [](const auto& info) {
+    std::string name = info.param.answeredAs ? "Served_" : "Empty_";
+    for (char c : info.param.sent) name += isalnum(static_cast<unsigned char>(c)) ? c : '_';
+    return name + std::to_string(info.index);
+});
+
+TEST_F(Dispatcher, AnEmptyRequestGetsAnEmptyAnswer) {
+    void* response = nullptr;
+    uint32_t length = 1;
+    EXPECT_EQ(0, Generate_Operation_Result_Server(nullptr, 0, &response, &length));
+    delete[] static_cast<uint8_t*>(response);
+    EXPECT_EQ(0u, length);
+}
+
+// The lookup is repeated for every command, so a module registered after the
+// server started serves from the next command on.
+TEST_F(Dispatcher, WithoutARegisteredModuleTheAnswerIsEmpty) {
+    setModuleName_Server("vok-not-yet-registered");
+    EXPECT_EQ("", dispatch(requestBytes("C_GetInfo")));
+    EXPECT_EQ(0u, fake_vendor_call_count());
+    voktest::registerModule("vok-not-yet-registered", fake_vendor_function_list());
+    EXPECT_EQ("C_GetInfo", parsed(dispatch(requestBytes("C_GetInfo"))).name());
+}
+
+TEST_F(Dispatcher, WithoutANameTheFirstModuleServes) {
+    char* previous = mModuleName;  // dropped, not freed: the caller's to release
+    EXPECT_EQ(0, setModuleName_Server(nullptr));
+    EXPECT_EQ(nullptr, mModuleName);
+    EXPECT_STREQ(kModuleName, previous);
+    std::free(previous);
+    EXPECT_EQ("C_GetInfo", parsed(dispatch(requestBytes("C_GetInfo"))).name());
+    EXPECT_EQ("C_GetInfo", fakevendor::lastCall("C_GetInfo").function);
+}
+
+// Each parse replaces the whole request: a list sent with one command is not
+// seen by the next, which is a pure length query.
+TEST_F(Dispatcher, ACommandSeesNothingOfThePreviousOne) {
+    dispatch(requestBytes("C_GetSlotList", [](auto& op) {
+        op.mutable_slotlist()->add_slotidlist(0), op.mutable_slotlist()->set_pulcount(2);
+    }));
+    dispatch(requestBytes("C_GetSlotList"));
+    std::vector<fakevendor::Call> calls = fakevendor::callsOf("C_GetSlotList");
+    ASSERT_EQ(2u, calls.size());
+    EXPECT_FALSE(calls[0].arg("pSlotList").null);
+    EXPECT_TRUE(calls[1].arg("pSlotList").null);
+    EXPECT_EQ(0u, calls[1].arg("pulCount").number);
+    EXPECT_FALSE(operation.has_slotlist());
+}
+
+// ---- Requests no proxy would send --------------------------------------------------
+
+constexpr uint64_t kHuge = uint64_t{1} << 62;
+constexpr uint64_t kAll = ~uint64_t{0};
+constexpr uint64_t kOverHalfAFrame = (uint64_t{3} << 29);  // 1.5 GiB, each fits, both do not
+
+struct Oversized {
+    const char* label;
+    const char* command;
+    Fill fill;
+};
+
+void value(pkcs11::CK_ATTRIBUTE* a, uint64_t length) {
+    a->set_pvalue("v"), a->set_ulvaluelen(length);
+}
+
+const Oversized kOversized[] = {
+    {"SlotListCount", "C_GetSlotList",
+     [](auto& op) {
+         op.mutable_slotlist()->add_slotidlist(0), op.mutable_slotlist()->set_pulcount(kAll);
+     }},
+    {"MechanismListCount", "C_GetMechanismList",
+     [](auto& op) {
+         op.mutable_mechanismlist()->add_pmechanismlist(0),
+             op.mutable_mechanismlist()->set_pulcount(kHuge);
+     }},
+    {"FindObjectsMaximum", "C_FindObjects",
+     [](auto& op) { op.mutable_findobj()->set_ulmaxobjectcount(kHuge); }},
+    {"TemplateCount", "C_CreateObject",
+     [](auto& op) { op.mutable_createobject()->set_ulcount(kAll); }},
+    // Allocatable, but its echo would cost the service gigabytes.
+    {"SearchTemplateCount", "C_FindObjectsInit",
+     [](auto& op) { op.mutable_findobjinit()->set_ulcount((uint64_t{1} << 20) + 1); }},
+    {"ValueLength", "C_GetAttributeValue",
+     [](auto& op) {
+         value(op.mutable_attvalue()->add_attribute(), kHuge);
+         op.mutable_attvalue()->set_ulcount(1);
+     }},
+    {"SearchValueLength", "C_FindObjectsInit",
+     [](auto& op) {
+         op.mutable_findobjinit()->add_attribute()->set_ulvaluelen(kAll);
+         op.mutable_findobjinit()->set_ulcount(1);
+     }},
+    {"AllValuesTogether", "C_SetAttributeValue",
+     [](auto& op) {
+         value(op.mutable_setattributevalue()->add_ptemplate(), kOverHalfAFrame);
+         value(op.mutable_setattributevalue()->add_ptemplate(), kOverHalfAFrame);
+         op.mutable_setattributevalue()->set_ulcount(2);
+     }},
+    {"PinLength", "C_Login",
+     [](auto& op) { op.mutable_login()->set_ppin("1"), op.mutable_login()->set_ulpinlen(kHuge); }},
+    {"NewPinLength", "C_SetPin", [](auto& op) { op.mutable_setpin()->set_ulnewlen(kAll); }},
+    {"OperationStateLength", "C_GetOperationState",
+     [](auto& op) { op.mutable_getoperationstate()->set_puloperationstatelen(uint64_t{1} << 31); }},
+    {"SavedStateLength", "C_SetOperationState",
+     [](auto& op) { op.mutable_setoperationstate()->set_uloperationstatelen(kHuge); }},
+};
+
+void PrintTo(const Oversized& o, std::ostream* os) { *os << o.label; }
+
+class OversizedRequest : public Dispatcher, public ::testing::WithParamInterface<Oversized> {};
+
+TEST_P(OversizedRequest, GetsTheEmptyAnswerWithoutCallingTheModule) {
+    EXPECT_EQ("", dispatch(requestBytes(GetParam().command, GetParam().fill)));
+    EXPECT_EQ(0u, fake_vendor_call_count());
+}
+
+INSTANTIATE_TEST_SUITE_P(Dispatcher, OversizedRequest, ::testing::ValuesIn(kOversized),
+                         [](const auto& info) { return std::string(info.param.label); });
+
+// Every prefix of real requests, and random bytes behind real names and on
+// their own: the service answers each (possibly with nothing) and goes on.
+TEST_F(Dispatcher, TruncatedAndRandomRequestsAreSurvived) {
+    std::vector<std::string> requests = {
+        requestBytes("C_CreateObject",
+                     [](auto& op) {
+                         auto* m = op.mutable_createobject();
+                         value(m->add_ptemplate(), 40), value(m->add_ptemplate(), 3),
+                             m->set_ulcount(5);
+                     }),
+        requestBytes("C_GetSlotList",
+                     [](auto& op) {
+                         op.mutable_slotlist()->add_slotidlist(1),
+                             op.mutable_slotlist()->set_pulcount(9);
+                     }),
+        requestBytes("C_InitToken",
+                     [](auto& op) { op.mutable_inittoken()->set_plabel(std::string(50, 'x')); }),
+    };
+    std::mt19937 random(20240101);
+    for (const Route& r : routes()) {
+        for (int i = 0; i < 20; ++i) {
+            std::string tail(random() % 64, '\0');
+            for (char& c : tail) c = static_cast<char>(random());
+            requests.push_back(requestBytes(r.sent) + tail);
+        }
+    }
+    for (int i = 0; i < 500; ++i) {
+        std::string bytes(random() % 128, '\0');
+        for (char& c : bytes) c = static_cast<char>(random());
+        requests.push_back(bytes);
+    }
+    for (const std::string& request : requests) {
+        for (size_t length = 0; length <= request.size(); ++length) {
+            const std::string answer = dispatch(request.substr(0, length));
+            pkcs11::OperationResult res;
+            EXPECT_TRUE(answer.empty() || res.ParseFromString(answer));
+        }
+    }
+}
+
+}  // namespace

@@ -1,0 +1,552 @@
+// The handlers against the fake vendor module: what the module receives, and
+// the exact answer.
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <cstddef>
+#include <cstring>
+#include <optional>
+#include <ostream>
+#include <string>
+#include <vector>
+
+#include "log_capture.h"
+#include "server_test_support.h"
+
+namespace {
+
+using namespace servertest;
+using ::testing::ElementsAre;
+using ::testing::IsSupersetOf;
+using Result = pkcs11::OperationResult;
+
+std::string pad(const std::string& text, size_t width) {
+    return text + std::string(width - text.size(), ' ');
+}
+std::string zeros(size_t bytes) { return std::string(2 * bytes, '0'); }
+
+// ---- The frame, for every handler --------------------------------------------
+
+// Reports whether the handler's answer sub-message is present and removes it.
+using AnswerProbe = bool (*)(Result&);
+#define ANSWER(field)                         \
+    [](Result& r) {                           \
+        const bool present = r.has_##field(); \
+        r.clear_##field();                    \
+        return present;                       \
+    }
+
+struct FrameRow {
+    const char* command;
+    Handler handler;
+    const char* moduleFunction;
+    AnswerProbe answer;  // nullptr: only name and result
+};
+
+void PrintTo(const FrameRow& row, std::ostream* os) { *os << row.command; }
+
+const FrameRow kFrameRows[] = {
+    {"C_Initialize", C_Initialize_Server, "C_Initialize", nullptr},
+    {"C_Finalize", C_Finalize_Server, "C_Finalize", nullptr},
+    {"C_GetInfo", C_GetInfo_Server, "C_GetInfo", ANSWER(infores)},
+    {"C_GetSlotList", C_GetSlotList_Server, "C_GetSlotList", ANSWER(slotlistres)},
+    {"C_GetSlotInfo", C_GetSlotInfo_Server, "C_GetSlotInfo", ANSWER(slotinfores)},
+    {"C_GetTokenInfo", C_GetTokenInfo_Server, "C_GetTokenInfo", ANSWER(tokeninfores)},
+    {"C_GetMechanismList", C_GetMechanismList_Server, "C_GetMechanismList",
+     ANSWER(mechanismlistres)},
+    {"C_GetMechanismInfo", C_GetMechanismInfo_Server, "C_GetMechanismInfo",
+     ANSWER(mechanisminfores)},
+    {"C_InitToken", C_InitToken_Server, "C_InitToken", nullptr},
+    {"C_InitPin", C_InitPin_Server, "C_InitPIN", nullptr},
+    {"C_SetPin", C_SetPin_Server, "C_SetPIN", nullptr},
+    {"C_OpenSession", C_OpenSession_Server, "C_OpenSession", ANSWER(opensesres)},
+    {"C_CloseSession", C_CloseSession_Server, "C_CloseSession", nullptr},
+    {"C_CloseAllSessions", C_CloseAllSessions_Server, "C_CloseAllSessions", nullptr},
+    {"C_GetSessionInfo", C_GetSessionInfo_Server, "C_GetSessionInfo", ANSWER(sessioninfores)},
+    {"C_GetOperationState", C_GetOperationState_Server, "C_GetOperationState",
+     ANSWER(getoperationstateres)},
+    {"C_SetOperationState", C_SetOperationState_Server, "C_SetOperationState", nullptr},
+    {"C_Login", C_Login_Server, "C_Login", nullptr},
+    {"C_Logout", C_Logout_Server, "C_Logout", nullptr},
+    {"C_CreateObject", C_CreateObject_Server, "C_CreateObject", ANSWER(createobjectres)},
+    {"C_CopyObject", C_CopyObject_Server, "C_CopyObject", ANSWER(copyobjectres)},
+    {"C_DestroyObject", C_DestroyObject_Server, "C_DestroyObject", nullptr},
+    {"C_GetObjectSize", C_GetObjectSize_Server, "C_GetObjectSize", ANSWER(getobjectsizeres)},
+    {"C_GetAttributeValue", C_GetAttributeValue_Server, "C_GetAttributeValue", ANSWER(attvalueres)},
+    {"C_SetAttributeValue", C_SetAttributeValue_Server, "C_SetAttributeValue",
+     ANSWER(setattributevalueres)},
+    {"C_FindObjectsInit", C_FindObjectsInit_Server, "C_FindObjectsInit", ANSWER(findobjintres)},
+    {"C_FindObjects", C_FindObjects_Server, "C_FindObjects", ANSWER(findobjres)},
+    {"C_FindObjectsFinal", C_FindObjectsFinal_Server, "C_FindObjectsFinal", nullptr},
+};
+
+class Frame : public FakeModuleTest, public ::testing::WithParamInterface<FrameRow> {};
+
+// The request carries no sub-message at all: every handler must cope with the
+// default instance, and must send its outputs even after a failing call.
+TEST_P(Frame, AFailingCallIsAnsweredWithItsResultAndOutputs) {
+    const FrameRow& row = GetParam();
+    const CK_RV failure = CKR_VENDOR_DEFINED | 0x5a;
+    ASSERT_EQ(CKR_OK, fake_vendor_set_next_rv(row.moduleFunction, failure));
+    Result res = parsed(row.handler(requestBytes(row.command)));
+    EXPECT_EQ(row.command, res.name());
+    EXPECT_EQ(failure, res.result());
+    EXPECT_TRUE(!row.answer || row.answer(res)) << "answer sub-message missing";
+    EXPECT_EQ(bareAnswer(row.command, failure), res.SerializeAsString()) << "unexpected field";
+    std::vector<fakevendor::Call> calls = fakevendor::calls();
+    ASSERT_EQ(1u, calls.size());
+    EXPECT_EQ(row.moduleFunction, calls[0].function);
+}
+
+TEST_P(Frame, WithoutAModuleTheAnswerIsEmpty) {
+    ckpFunctions = nullptr;
+    EXPECT_EQ("", GetParam().handler(requestBytes(GetParam().command)));
+    EXPECT_EQ(0u, fake_vendor_call_count());
+}
+
+INSTANTIATE_TEST_SUITE_P(Handlers, Frame, ::testing::ValuesIn(kFrameRows),
+                         [](const auto& info) { return std::string(info.param.command); });
+
+// ---- What the module receives --------------------------------------------------
+
+// Expected lines of the fake's record: "<name> <null> <number> <hex|-> <items> [<type> <null>
+// <len> <hex|->]...".
+struct ReceiveRow {
+    const char* label;
+    Handler handler;
+    const char* command;
+    const char* moduleFunction;
+    Fill fill;
+    std::vector<std::string> lines;
+};
+
+void PrintTo(const ReceiveRow& row, std::ostream* os) { *os << row.label; }
+
+void attribute(google::protobuf::RepeatedPtrField<pkcs11::CK_ATTRIBUTE>* list, CK_ULONG type,
+               const std::optional<std::string>& value, CK_ULONG length) {
+    pkcs11::CK_ATTRIBUTE* a = list->Add();
+    a->set_type(type);
+    if (value) a->set_pvalue(*value);
+    a->set_ulvaluelen(length);
+}
+
+const ReceiveRow kReceiveRows[] = {
+    {"InitializeAlwaysWithoutArguments",
+     C_Initialize_Server,
+     "C_Initialize",
+     "C_Initialize",
+     [](auto& op) { op.mutable_initialize()->set_flags(true); },
+     {"pInitArgs 1 0 - 0"}},
+    {"SlotListWithoutEntriesIsALengthQuery",
+     C_GetSlotList_Server,
+     "C_GetSlotList",
+     "C_GetSlotList",
+     [](auto& op) {
+         op.mutable_slotlist()->set_tokenpresent(true), op.mutable_slotlist()->set_pulcount(4);
+     },
+     {"tokenPresent 1 1 - 0", "pSlotList 1 0 - 0", "pulCount 0 4 - 0"}},
+    {"SlotListEntriesAskForACapacityBuffer",
+     C_GetSlotList_Server,
+     "C_GetSlotList",
+     "C_GetSlotList",
+     [](auto& op) {
+         auto* m = op.mutable_slotlist();
+         m->add_slotidlist(7), m->add_slotidlist(7), m->set_pulcount(4);
+     },
+     {"pSlotList 0 0 " + zeros(32) + " 0", "pulCount 0 4 - 0"}},
+    {"LoginPinShorterThanItsLengthEndsInZeros",
+     C_Login_Server,
+     "C_Login",
+     "C_Login",
+     [](auto& op) { op.mutable_login()->set_ppin("12"), op.mutable_login()->set_ulpinlen(4); },
+     {"pPin 0 0 31320000 0", "ulPinLen 1 4 - 0"}},
+    {"LoginPinLongerThanItsLengthIsCut",
+     C_Login_Server,
+     "C_Login",
+     "C_Login",
+     [](auto& op) { op.mutable_login()->set_ppin("123456"), op.mutable_login()->set_ulpinlen(3); },
+     {"pPin 0 0 313233 0", "ulPinLen 1 3 - 0"}},
+    {"InitTokenLabelIsBlankPadded",
+     C_InitToken_Server,
+     "C_InitToken",
+     "C_InitToken",
+     [](auto& op) {
+         auto* m = op.mutable_inittoken();
+         m->set_slotid(1), m->set_ppin("5678"), m->set_ulpinlen(4), m->set_plabel("new");
+     },
+     {"slotID 1 1 - 0", "pPin 0 0 35363738 0",
+      "pLabel 0 0 6e6577" + hex(std::string(29, ' ')) + " 0"}},
+    {"SetPinBothPins",
+     C_SetPin_Server,
+     "C_SetPin",
+     "C_SetPIN",
+     [](auto& op) {
+         auto* m = op.mutable_setpin();
+         m->set_poldpin("1234"), m->set_uloldlen(4), m->set_pnewpin("87"), m->set_ulnewlen(2);
+     },
+     {"pOldPin 0 0 31323334 0", "ulOldLen 1 4 - 0", "pNewPin 0 0 3837 0", "ulNewLen 1 2 - 0"}},
+    {"OpenSessionNeverPassesACallback",
+     C_OpenSession_Server,
+     "C_OpenSession",
+     "C_OpenSession",
+     [](auto& op) {
+         op.mutable_openses()->set_slotid(1),
+             op.mutable_openses()->set_flags(CKF_SERIAL_SESSION | CKF_RW_SESSION);
+     },
+     {"slotID 1 1 - 0", "flags 1 6 - 0", "pApplication 1 0 - 0", "Notify 1 0 - 0",
+      "phSession 0 0 - 0"}},
+    {"SetOperationStateShortStateEndsInZeros",
+     C_SetOperationState_Server,
+     "C_SetOperationState",
+     "C_SetOperationState",
+     [](auto& op) {
+         auto* m = op.mutable_setoperationstate();
+         m->set_poperationstate("ab"), m->set_uloperationstatelen(4), m->set_hencryptionkey(7),
+             m->set_hauthenticationkey(8);
+     },
+     {"pOperationState 0 0 61620000 0", "ulOperationStateLen 1 4 - 0", "hEncryptionKey 1 7 - 0",
+      "hAuthenticationKey 1 8 - 0"}},
+    // Values shorter than stated end in zeros; entries beyond the list are zero;
+    // an attribute without a value passes NULL with its length.
+    {"CreateObjectTemplate",
+     C_CreateObject_Server,
+     "C_CreateObject",
+     "C_CreateObject",
+     [](auto& op) {
+         auto* m = op.mutable_createobject();
+         attribute(m->mutable_ptemplate(), CKA_LABEL, "ab", 4);
+         attribute(m->mutable_ptemplate(), CKA_APPLICATION, std::nullopt, 5);
+         m->set_hsession(1), m->set_ulcount(3);
+     },
+     {"pTemplate 0 0 - 3 3 0 4 61620000 16 1 5 - 0 1 0 -", "ulCount 1 3 - 0"}},
+    {"FindObjectsInitAlwaysPassesAValueBuffer",
+     C_FindObjectsInit_Server,
+     "C_FindObjectsInit",
+     "C_FindObjectsInit",
+     [](auto& op) {
+         attribute(op.mutable_findobjinit()->mutable_attribute(), CKA_LABEL, std::nullopt, 2);
+         op.mutable_findobjinit()->set_ulcount(1);
+     },
+     {"pTemplate 0 0 - 1 3 0 2 0000", "ulCount 1 1 - 0"}},
+    {"FindObjectsWithMaximumZeroStillPassesABuffer",
+     C_FindObjects_Server,
+     "C_FindObjects",
+     "C_FindObjects",
+     [](auto& op) { op.mutable_findobj()->set_hsession(1); },
+     {"hSession 1 1 - 0", "phObject 0 0 - 0", "ulMaxObjectCount 1 0 - 0",
+      "pulObjectCount 0 0 - 0"}},
+};
+
+class ModuleReceives : public FakeModuleTest, public ::testing::WithParamInterface<ReceiveRow> {};
+
+TEST_P(ModuleReceives, WhatTheRequestSays) {
+    const ReceiveRow& row = GetParam();
+    row.handler(requestBytes(row.command, row.fill));
+    const fakevendor::Call call = fakevendor::lastCall(row.moduleFunction);
+    std::vector<std::string> lines;
+    for (size_t start = call.text.find('\n') + 1, end; start != 0; start = end + 1) {
+        end = call.text.find('\n', start);
+        lines.push_back(call.text.substr(start, end - start));
+        if (end == std::string::npos) break;
+    }
+    EXPECT_THAT(lines, IsSupersetOf(row.lines)) << call.text;
+}
+
+INSTANTIATE_TEST_SUITE_P(Handlers, ModuleReceives, ::testing::ValuesIn(kReceiveRows),
+                         [](const auto& info) { return std::string(info.param.label); });
+
+// ---- The exact answer ---------------------------------------------------------
+
+constexpr CK_OBJECT_HANDLE kLabelOne = FAKE_VENDOR_FIRST_OBJECT_HANDLE;  // "label-one"
+constexpr CK_OBJECT_HANDLE kSensitiveKey = FAKE_VENDOR_FIRST_OBJECT_HANDLE + 2;
+constexpr CK_SESSION_HANDLE kSession = 1;
+
+struct AnswerRow {
+    const char* label;
+    void (*patch)(CK_FUNCTION_LIST&);  // a misbehaving module; nullptr: the fake as it is
+    Handler handler;
+    const char* command;
+    Fill fill;
+    CK_RV rv;
+    std::function<void(Result&)> expect;  // everything but name and result
+};
+
+void PrintTo(const AnswerRow& row, std::ostream* os) { *os << row.label; }
+
+void version(pkcs11::CK_VERSION* v, int major, int minor) {
+    v->set_vermajor(major), v->set_verminor(minor);
+}
+
+void getLabel(pkcs11::Operation& op, CK_OBJECT_HANDLE object,
+              const std::optional<std::string>& value, CK_ULONG length) {
+    auto* m = op.mutable_attvalue();
+    m->set_hsession(kSession), m->set_hobject(object), m->set_ulcount(1);
+    attribute(m->mutable_attribute(), CKA_LABEL, value, length);
+}
+
+// Misbehaving modules: they report more than they were given room for, or
+// mark a value unavailable.
+CK_RV overReportedList(CK_ULONG_PTR list, CK_ULONG_PTR count) {
+    for (CK_ULONG i = 0; list && i < *count; ++i) list[i] = 100 + i;
+    *count = 1000;
+    return CKR_OK;
+}
+void overReportSlots(CK_FUNCTION_LIST& l) {
+    l.C_GetSlotList = [](CK_BBOOL, CK_SLOT_ID_PTR list, CK_ULONG_PTR n) {
+        return overReportedList(list, n);
+    };
+}
+void overReportFound(CK_FUNCTION_LIST& l) {
+    l.C_FindObjects = [](CK_SESSION_HANDLE, CK_OBJECT_HANDLE_PTR handles, CK_ULONG max,
+                         CK_ULONG_PTR found) {
+        for (CK_ULONG i = 0; i < max; ++i) handles[i] = 7;
+        *found = max + 1;
+        return CKR_OK;
+    };
+}
+void overReportState(CK_FUNCTION_LIST& l) {
+    l.C_GetOperationState = [](CK_SESSION_HANDLE, CK_BYTE_PTR state, CK_ULONG_PTR length) {
+        memset(state, 'S', *length);
+        *length = 1000;
+        return CKR_OK;
+    };
+}
+void overReportValue(CK_FUNCTION_LIST& l) {
+    l.C_GetAttributeValue = [](CK_SESSION_HANDLE, CK_OBJECT_HANDLE, CK_ATTRIBUTE_PTR t,
+                               CK_ULONG n) {
+        for (CK_ULONG i = 0; i < n; ++i)
+            memset(t[i].pValue, 'v', t[i].ulValueLen), t[i].ulValueLen = 100;
+        return CKR_OK;
+    };
+}
+CK_RV markUnavailable(CK_ATTRIBUTE_PTR t, CK_ULONG n) {
+    for (CK_ULONG i = 0; i < n; ++i) t[i].ulValueLen = CK_UNAVAILABLE_INFORMATION;
+    return CKR_ATTRIBUTE_TYPE_INVALID;
+}
+void unavailableInSearch(CK_FUNCTION_LIST& l) {
+    l.C_FindObjectsInit = [](CK_SESSION_HANDLE, CK_ATTRIBUTE_PTR t, CK_ULONG n) {
+        return markUnavailable(t, n);
+    };
+}
+void unavailableInSet(CK_FUNCTION_LIST& l) {
+    l.C_SetAttributeValue = [](CK_SESSION_HANDLE, CK_OBJECT_HANDLE, CK_ATTRIBUTE_PTR t,
+                               CK_ULONG n) { return markUnavailable(t, n); };
+}
+
+const std::string kVendor = pad("Vok test vendor", 32);
+
+const AnswerRow kAnswerRows[] = {
+    {"InfoTextsRunOnToTheFirstZeroOrTheEnd",
+     nullptr,
+     C_GetInfo_Server,
+     "C_GetInfo",
+     {},
+     CKR_OK,
+     [](Result& r) {
+         auto* i = r.mutable_infores()->mutable_ckinfo();
+         version(i->mutable_cryptokiversion(), 2, 40);
+         i->set_manufacturerid(kVendor), i->set_flags(0);
+         i->set_librarydescription(pad("Fake vendor module", 32) + "\x01\x02");
+         version(i->mutable_libraryversion(), 1, 2);
+     }},
+    {"SlotListLengthQueryCountsTheSlots", nullptr, C_GetSlotList_Server, "C_GetSlotList",
+     [](auto& op) { op.mutable_slotlist(); }, CKR_OK,
+     [](Result& r) { r.mutable_slotlistres()->set_pulcount(2); }},
+    {"SlotListOfCapacityFourOnTwoSlots", nullptr, C_GetSlotList_Server, "C_GetSlotList",
+     [](auto& op) {
+         for (int i = 0; i < 4; ++i) op.mutable_slotlist()->add_slotidlist(0);
+         op.mutable_slotlist()->set_pulcount(4);
+     },
+     CKR_OK,
+     [](Result& r) {
+         auto* l = r.mutable_slotlistres();
+         l->add_slotidlist(1), l->add_slotidlist(2), l->set_pulcount(2);
+     }},
+    {"SlotListTooSmallStillSendsCountAndEntries", nullptr, C_GetSlotList_Server, "C_GetSlotList",
+     [](auto& op) {
+         op.mutable_slotlist()->add_slotidlist(9), op.mutable_slotlist()->set_pulcount(1);
+     },
+     CKR_BUFFER_TOO_SMALL,
+     [](Result& r) {
+         r.mutable_slotlistres()->add_slotidlist(0), r.mutable_slotlistres()->set_pulcount(2);
+     }},
+    {"SlotListOverReportedIsCutAtTheAllocation", overReportSlots, C_GetSlotList_Server,
+     "C_GetSlotList",
+     [](auto& op) {
+         op.mutable_slotlist()->add_slotidlist(0), op.mutable_slotlist()->set_pulcount(2);
+     },
+     CKR_OK,
+     [](Result& r) {
+         auto* l = r.mutable_slotlistres();
+         l->add_slotidlist(100), l->add_slotidlist(101), l->set_pulcount(1000);
+     }},
+    {"OperationStateOverReportedIsCutAtTheAllocation", overReportState, C_GetOperationState_Server,
+     "C_GetOperationState",
+     [](auto& op) { op.mutable_getoperationstate()->set_puloperationstatelen(3); }, CKR_OK,
+     [](Result& r) {
+         r.mutable_getoperationstateres()->set_poperationstate("SSS");
+         r.mutable_getoperationstateres()->set_puloperationstatelen(1000);
+     }},
+    {"AttributeWithoutValueGetsItsLength", nullptr, C_GetAttributeValue_Server,
+     "C_GetAttributeValue", [](auto& op) { getLabel(op, kLabelOne, std::nullopt, 0); }, CKR_OK,
+     [](Result& r) {
+         attribute(r.mutable_attvalueres()->mutable_attribute(), CKA_LABEL, std::nullopt, 9);
+         r.mutable_attvalueres()->set_ulcount(1);
+     }},
+    {"SensitiveAttributeComesBackAsTypeOnly", nullptr, C_GetAttributeValue_Server,
+     "C_GetAttributeValue",
+     [](auto& op) {
+         getLabel(op, kSensitiveKey, "xxxxxxxxxxxxxxxx", 16);
+         op.mutable_attvalue()->mutable_attribute(0)->set_type(CKA_VALUE);
+     },
+     CKR_ATTRIBUTE_SENSITIVE,
+     [](Result& r) {
+         r.mutable_attvalueres()->add_attribute()->set_type(CKA_VALUE);
+         r.mutable_attvalueres()->set_ulcount(1);
+     }},
+    {"AttributeLengthOverReportedIsCutAtTheBuffer", overReportValue, C_GetAttributeValue_Server,
+     "C_GetAttributeValue", [](auto& op) { getLabel(op, kLabelOne, "xxxx", 4); }, CKR_OK,
+     [](Result& r) {
+         attribute(r.mutable_attvalueres()->mutable_attribute(), CKA_LABEL, "vvvv", 100);
+         r.mutable_attvalueres()->set_ulcount(1);
+     }},
+    {"SetAttributeValueEchoesTheTemplate", nullptr, C_SetAttributeValue_Server,
+     "C_SetAttributeValue",
+     [](auto& op) {
+         auto* m = op.mutable_setattributevalue();
+         attribute(m->mutable_ptemplate(), CKA_LABEL, "renamed", 7);
+         m->set_hsession(kSession), m->set_hobject(kLabelOne), m->set_ulcount(1);
+     },
+     CKR_OK,
+     [](Result& r) {
+         attribute(r.mutable_setattributevalueres()->mutable_ptemplate(), CKA_LABEL, "renamed", 7);
+         r.mutable_setattributevalueres()->set_ulcount(1);
+     }},
+    {"SetAttributeValueDropsAnUnavailableLength", unavailableInSet, C_SetAttributeValue_Server,
+     "C_SetAttributeValue",
+     [](auto& op) {
+         attribute(op.mutable_setattributevalue()->mutable_ptemplate(), CKA_LABEL, "ab", 2);
+         op.mutable_setattributevalue()->set_ulcount(1);
+     },
+     CKR_ATTRIBUTE_TYPE_INVALID,
+     [](Result& r) {
+         r.mutable_setattributevalueres()->add_ptemplate()->set_type(CKA_LABEL);
+         r.mutable_setattributevalueres()->set_ulcount(1);
+     }},
+    {"FindObjectsInitEchoesEveryValue", nullptr, C_FindObjectsInit_Server, "C_FindObjectsInit",
+     [](auto& op) {
+         attribute(op.mutable_findobjinit()->mutable_attribute(), CKA_LABEL, std::nullopt, 3);
+         op.mutable_findobjinit()->set_hsession(kSession), op.mutable_findobjinit()->set_ulcount(1);
+     },
+     CKR_OK,
+     [](Result& r) {
+         auto* a = r.mutable_findobjintres()->add_attribute();
+         a->set_type(CKA_LABEL), a->set_pvalue(std::string(3, '\0')), a->set_ulvaluelen(3);
+         r.mutable_findobjintres()->set_ulcount(1);
+     }},
+    {"FindObjectsInitEchoesAnUnavailableLengthVerbatim", unavailableInSearch,
+     C_FindObjectsInit_Server, "C_FindObjectsInit",
+     [](auto& op) {
+         attribute(op.mutable_findobjinit()->mutable_attribute(), CKA_LABEL, "ab", 2);
+         op.mutable_findobjinit()->set_ulcount(1);
+     },
+     CKR_ATTRIBUTE_TYPE_INVALID,
+     [](Result& r) {
+         attribute(r.mutable_findobjintres()->mutable_attribute(), CKA_LABEL, "ab",
+                   CK_UNAVAILABLE_INFORMATION);
+         r.mutable_findobjintres()->set_ulcount(1);
+     }},
+    {"FindObjectsOverReportedSendsNoHandles", overReportFound, C_FindObjects_Server,
+     "C_FindObjects", [](auto& op) { op.mutable_findobj()->set_ulmaxobjectcount(3); }, CKR_OK,
+     [](Result& r) { r.mutable_findobjres()->set_pulobjectcount(4); }},
+};
+
+// Slot 1 holds "label-one", "label-two" and a sensitive key, seen through a
+// logged-in read/write session; there are two slots.
+class PreparedToken : public FakeModuleTest {
+protected:
+    void SetUp() override {
+        FakeModuleTest::SetUp();
+        fake_vendor_set_slot_count(2);
+        const CK_SESSION_HANDLE session = openUserSession();
+        createData(session, "label-one");
+        createData(session, "label-two");
+        createSensitiveKey(session);
+        fake_vendor_clear_calls();
+    }
+};
+
+class Answers : public PreparedToken, public ::testing::WithParamInterface<AnswerRow> {};
+
+TEST_P(Answers, Exactly) {
+    const AnswerRow& row = GetParam();
+    CK_FUNCTION_LIST patched = *module_;
+    if (row.patch) row.patch(patched), ckpFunctions = &patched;
+    Result expected;
+    expected.set_name(row.command);
+    expected.set_result(row.rv);
+    row.expect(expected);
+    const std::string answer = row.handler(requestBytes(row.command, row.fill));
+    EXPECT_EQ(hex(expected.SerializeAsString()), hex(answer));
+}
+
+INSTANTIATE_TEST_SUITE_P(Handlers, Answers, ::testing::ValuesIn(kAnswerRows),
+                         [](const auto& info) { return std::string(info.param.label); });
+
+TEST_F(PreparedToken, FoundHandlesComeBackUpToTheMaximum) {
+    Result init = parsed(C_FindObjectsInit_Server(requestBytes(
+        "C_FindObjectsInit", [](auto& op) { op.mutable_findobjinit()->set_hsession(kSession); })));
+    ASSERT_EQ(CKR_OK, init.result());
+    auto find = [](CK_ULONG max) {
+        return parsed(C_FindObjects_Server(requestBytes("C_FindObjects", [max](auto& op) {
+            op.mutable_findobj()->set_hsession(kSession),
+                op.mutable_findobj()->set_ulmaxobjectcount(max);
+        })));
+    };
+    Result none = find(0);
+    EXPECT_EQ(CKR_OK, none.result());
+    EXPECT_EQ(0u, none.findobjres().pulobjectcount());
+    EXPECT_EQ(0, none.findobjres().phobject_size());
+    Result two = find(2);
+    EXPECT_THAT(two.findobjres().phobject(), ElementsAre(kLabelOne, kLabelOne + 1));
+    EXPECT_EQ(2u, two.findobjres().pulobjectcount());
+}
+
+// A module that fills every byte: each text runs on, but not past the end.
+TEST_F(PreparedToken, RunOnTextStopsAtTheEndOfTheStructure) {
+    CK_FUNCTION_LIST patched = *module_;
+    patched.C_GetTokenInfo = [](CK_SLOT_ID, CK_TOKEN_INFO_PTR info) {
+        memset(info, 'A', sizeof *info);
+        return CKR_OK;
+    };
+    ckpFunctions = &patched;
+    const Result res = parsed(C_GetTokenInfo_Server(requestBytes("C_GetTokenInfo")));
+    const pkcs11::CK_TOKEN_INFO& info = res.tokeninfores().pinfo();
+    EXPECT_EQ(std::string(sizeof(CK_TOKEN_INFO), 'A'), info.label());
+    EXPECT_EQ(std::string(sizeof(CK_TOKEN_INFO) - offsetof(CK_TOKEN_INFO, serialNumber), 'A'),
+              info.serialnumber());
+    EXPECT_EQ(std::string(16, 'A'), info.utctime());
+    EXPECT_EQ(0x4141414141414141u, info.ulfreeprivatememory());
+}
+
+TEST_F(PreparedToken, OpenSessionLogsTheHandleUnderItsOwnTag) {
+    voktest::LogCapture log;
+    C_OpenSession_Server(requestBytes("C_OpenSession", [](auto& op) {
+        op.mutable_openses()->set_slotid(1), op.mutable_openses()->set_flags(CKF_SERIAL_SESSION);
+    }));
+    ASSERT_EQ(CKR_OK, fake_vendor_set_next_rv("C_OpenSession", CKR_SLOT_ID_INVALID));
+    C_OpenSession_Server(requestBytes("C_OpenSession"));
+    EXPECT_THAT(
+        log.lines(),
+        IsSupersetOf({
+            voktest::LogLine{"DDDD", 3,
+                             "session is 2 and CK_ULONG size is 8, CK_SESSION_HANDLE size is 8"},
+            voktest::LogLine{"DDDD", 3,
+                             "session is 0 and CK_ULONG size is 8, CK_SESSION_HANDLE size is 8"},
+        }));
+    EXPECT_THAT(log.texts("Vokpkcs11f_Server"),
+                ElementsAre("ckpFunctions not null", "Opensession instance present",
+                            "ckpFunctions not null", "session from open session null"));
+}
+
+}  // namespace
