@@ -1,0 +1,490 @@
+// A native application process for the end-to-end tests: it loads the proxy
+// library the way an application would, opens the channel to a service and
+// drives PKCS#11 calls through the library's function list.
+//
+//   vok_e2e_client <library> <serverId> steps [--already-initialized]
+//       runs the step table; one line per step ("ok <step>" or
+//       "FAIL <step>: <why>"), exit status 0 when every step passed.
+//   vok_e2e_client <library> <serverId> call <function>...
+//       prints "connected", then for each function waits for a line on
+//       standard input, prints "calling <function>", makes the call and prints
+//       "<function> rv=0x<rv> ms=<elapsed>". Functions: C_Initialize,
+//       C_GetInfo, C_Finalize.
+//   vok_e2e_client <library> <serverId> stall
+//       without the library: sends the header of a request and half its
+//       payload by hand, prints "stalled" and waits for standard input to end.
+
+#include <dlfcn.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <chrono>
+#include <cstdint>
+#include <cstdio>
+#include <cstring>
+#include <functional>
+#include <iostream>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "vok_pkcs11.h"
+
+namespace {
+
+constexpr CK_RV kChannelFailure = ~static_cast<CK_RV>(0);
+constexpr int32_t kConnectFailed = 7;
+
+std::string hexRv(CK_RV rv) {
+    char text[32];
+    std::snprintf(text, sizeof text, "0x%llx", static_cast<unsigned long long>(rv));
+    return text;
+}
+
+// ---- The library ------------------------------------------------------------
+
+struct Library {
+    CK_FUNCTION_LIST_PTR functions = nullptr;
+};
+
+// Loads the library, opens its channel (waiting for a service that is still
+// starting to listen) and fetches its function list; exits on failure.
+Library openLibrary(const char* path, const char* serverId) {
+    void* handle = dlopen(path, RTLD_NOW | RTLD_LOCAL);
+    if (handle == nullptr) {
+        std::cout << "FAIL load: " << dlerror() << std::endl;
+        std::exit(2);
+    }
+    auto clientInit =
+        reinterpret_cast<int32_t (*)(const char*)>(dlsym(handle, "vokpkcs11_client_init"));
+    auto getFunctionList =
+        reinterpret_cast<CK_C_GetFunctionList>(dlsym(handle, "C_GetFunctionList"));
+    if (clientInit == nullptr || getFunctionList == nullptr) {
+        std::cout << "FAIL load: missing entry points" << std::endl;
+        std::exit(2);
+    }
+    int32_t status = kConnectFailed;
+    for (int attempt = 0; attempt < 100 && status == kConnectFailed; ++attempt) {
+        status = clientInit(serverId);
+        if (status == kConnectFailed) std::this_thread::sleep_for(std::chrono::milliseconds(100));
+    }
+    if (status != 0) {
+        std::cout << "FAIL vokpkcs11_client_init: status " << status << std::endl;
+        std::exit(2);
+    }
+    Library library;
+    CK_RV rv = getFunctionList(&library.functions);
+    if (rv != CKR_OK || library.functions == nullptr) {
+        std::cout << "FAIL C_GetFunctionList: rv " << hexRv(rv) << std::endl;
+        std::exit(2);
+    }
+    return library;
+}
+
+// ---- The step table -----------------------------------------------------------
+
+// What the steps share: the function list and the handles earlier steps made.
+struct Context {
+    CK_FUNCTION_LIST_PTR f = nullptr;
+    bool alreadyInitialized = false;
+    CK_SESSION_HANDLE session = CK_INVALID_HANDLE;
+    CK_OBJECT_HANDLE object = CK_INVALID_HANDLE;
+    CK_OBJECT_HANDLE copy = CK_INVALID_HANDLE;
+};
+
+// A step fails with a Failure: the rv of a call or an output was not as expected.
+struct Failure {
+    std::string why;
+};
+
+void expectRv(const char* call, CK_RV rv, CK_RV expected) {
+    if (rv != expected)
+        throw Failure{std::string(call) + " returned " + hexRv(rv) + ", expected " +
+                      hexRv(expected)};
+}
+
+void expectTrue(bool condition, const std::string& what) {
+    if (!condition) throw Failure{what};
+}
+
+template <size_t N>
+bool startsWith(const CK_UTF8CHAR (&field)[N], const std::string& text) {
+    return text.size() <= N && std::memcmp(field, text.data(), text.size()) == 0;
+}
+
+std::string bytesOf(const CK_ATTRIBUTE& a) {
+    return std::string(static_cast<const char*>(a.pValue), a.ulValueLen);
+}
+
+CK_ATTRIBUTE attribute(CK_ATTRIBUTE_TYPE type, const void* value, CK_ULONG length) {
+    return CK_ATTRIBUTE{type, const_cast<void*>(value), length};
+}
+
+// Reads one attribute of `object` with the two-call convention.
+std::string readAttribute(Context& c, CK_OBJECT_HANDLE object, CK_ATTRIBUTE_TYPE type) {
+    CK_ATTRIBUTE query = attribute(type, nullptr, 0);
+    expectRv("C_GetAttributeValue (length)", c.f->C_GetAttributeValue(c.session, object, &query, 1),
+             CKR_OK);
+    std::vector<char> value(query.ulValueLen);
+    CK_ATTRIBUTE read = attribute(type, value.data(), value.size());
+    expectRv("C_GetAttributeValue", c.f->C_GetAttributeValue(c.session, object, &read, 1), CKR_OK);
+    return bytesOf(read);
+}
+
+CK_ULONG sessionState(Context& c) {
+    CK_SESSION_INFO info{};
+    expectRv("C_GetSessionInfo", c.f->C_GetSessionInfo(c.session, &info), CKR_OK);
+    return info.state;
+}
+
+struct Step {
+    const char* name;
+    std::function<void(Context&)> run;  // throws Failure
+};
+
+const char kUserPin[] = "1234";
+const char kObjectLabel[] = "e2e data";
+const char kObjectValue[] = "hello";
+
+// The table, in the order a real application would call. Every function the
+// service can serve has a step; new handlers get theirs here.
+const std::vector<Step>& steps() {
+    static const std::vector<Step> table = {
+        {"C_Initialize",
+         [](Context& c) {
+             expectRv("C_Initialize", c.f->C_Initialize(nullptr),
+                      c.alreadyInitialized ? CKR_CRYPTOKI_ALREADY_INITIALIZED : CKR_OK);
+         }},
+        {"C_GetInfo",
+         [](Context& c) {
+             CK_INFO info{};
+             expectRv("C_GetInfo", c.f->C_GetInfo(&info), CKR_OK);
+             expectTrue(info.cryptokiVersion.major == 2 && info.cryptokiVersion.minor == 40,
+                        "cryptokiVersion is not 2.40");
+             expectTrue(startsWith(info.manufacturerID, "Vok test vendor"), "manufacturerID");
+             expectTrue(info.libraryVersion.minor == 2, "libraryVersion.minor is not 2");
+         }},
+        {"C_GetSlotList",
+         [](Context& c) {
+             CK_ULONG count = 0;
+             expectRv("C_GetSlotList (count)", c.f->C_GetSlotList(CK_TRUE, nullptr, &count),
+                      CKR_OK);
+             expectTrue(count == 1, "slot count " + std::to_string(count));
+             CK_SLOT_ID slots[1] = {0};
+             expectRv("C_GetSlotList", c.f->C_GetSlotList(CK_TRUE, slots, &count), CKR_OK);
+             expectTrue(count == 1 && slots[0] == 1, "slot list");
+         }},
+        {"C_GetSlotInfo",
+         [](Context& c) {
+             CK_SLOT_INFO info{};
+             expectRv("C_GetSlotInfo", c.f->C_GetSlotInfo(1, &info), CKR_OK);
+             expectTrue((info.flags & CKF_TOKEN_PRESENT) != 0, "no token present");
+             expectTrue(info.firmwareVersion.major == 5 && info.firmwareVersion.minor == 6,
+                        "firmwareVersion");
+         }},
+        {"C_GetTokenInfo",
+         [](Context& c) {
+             CK_TOKEN_INFO info{};
+             expectRv("C_GetTokenInfo", c.f->C_GetTokenInfo(1, &info), CKR_OK);
+             expectTrue(startsWith(info.model, "Fake token"), "model");
+             expectTrue(startsWith(info.serialNumber, "FAKE-1"), "serialNumber");
+             expectTrue((info.flags & CKF_TOKEN_INITIALIZED) != 0, "token not initialized");
+             expectTrue(info.ulMaxPinLen == 8 && info.ulFreePrivateMemory == 8192, "counters");
+         }},
+        {"C_GetMechanismList",
+         [](Context& c) {
+             CK_ULONG count = 0;
+             expectRv("C_GetMechanismList (count)", c.f->C_GetMechanismList(1, nullptr, &count),
+                      CKR_OK);
+             expectTrue(count > 0, "no mechanisms");
+             std::vector<CK_MECHANISM_TYPE> types(count);
+             expectRv("C_GetMechanismList", c.f->C_GetMechanismList(1, types.data(), &count),
+                      CKR_OK);
+             expectTrue(std::find(types.begin(), types.end(), CKM_SHA256) != types.end(),
+                        "no CKM_SHA256");
+         }},
+        {"C_GetMechanismInfo",
+         [](Context& c) {
+             CK_MECHANISM_INFO info{};
+             expectRv("C_GetMechanismInfo", c.f->C_GetMechanismInfo(1, CKM_AES_ECB, &info), CKR_OK);
+             expectTrue(info.ulMinKeySize == 16 && info.ulMaxKeySize == 32 &&
+                            (info.flags & CKF_ENCRYPT) != 0,
+                        "CKM_AES_ECB info");
+         }},
+        {"C_InitToken",
+         [](Context& c) {
+             // A wrong SO PIN: the token must stay as it is for the steps after.
+             CK_UTF8CHAR label[33];
+             std::memset(label, ' ', 32);
+             label[32] = 0;
+             CK_UTF8CHAR pin[] = "0000";
+             expectRv("C_InitToken", c.f->C_InitToken(1, pin, 4, label), CKR_PIN_INCORRECT);
+         }},
+        {"C_OpenSession",
+         [](Context& c) {
+             expectRv("C_OpenSession",
+                      c.f->C_OpenSession(1, CKF_SERIAL_SESSION | CKF_RW_SESSION, nullptr, nullptr,
+                                         &c.session),
+                      CKR_OK);
+             expectTrue(c.session != CK_INVALID_HANDLE, "no session handle");
+         }},
+        {"C_GetSessionInfo",
+         [](Context& c) {
+             CK_SESSION_INFO info{};
+             expectRv("C_GetSessionInfo", c.f->C_GetSessionInfo(c.session, &info), CKR_OK);
+             expectTrue(info.slotID == 1 && info.state == CKS_RW_PUBLIC_SESSION &&
+                            (info.flags & CKF_RW_SESSION) != 0,
+                        "session info");
+         }},
+        // The proxies send "C_InitPIN" and "C_SetPIN", names the service does
+        // not serve: the empty answer reaches the caller as all ones.
+        {"C_InitPIN",
+         [](Context& c) {
+             CK_UTF8CHAR pin[] = "4321";
+             expectRv("C_InitPIN", c.f->C_InitPIN(c.session, pin, 4), kChannelFailure);
+         }},
+        {"C_SetPIN",
+         [](Context& c) {
+             CK_UTF8CHAR oldPin[] = "1234";
+             CK_UTF8CHAR newPin[] = "4321";
+             expectRv("C_SetPIN", c.f->C_SetPIN(c.session, oldPin, 4, newPin, 4), kChannelFailure);
+         }},
+        {"C_Login",
+         [](Context& c) {
+             CK_UTF8CHAR pin[sizeof kUserPin];
+             std::memcpy(pin, kUserPin, sizeof kUserPin);
+             expectRv("C_Login", c.f->C_Login(c.session, CKU_USER, pin, sizeof kUserPin - 1),
+                      CKR_OK);
+             expectTrue(sessionState(c) == CKS_RW_USER_FUNCTIONS, "not logged in");
+         }},
+        {"C_CreateObject",
+         [](Context& c) {
+             CK_OBJECT_CLASS dataClass = CKO_DATA;
+             CK_BBOOL no = CK_FALSE;
+             CK_ATTRIBUTE object[] = {
+                 attribute(CKA_CLASS, &dataClass, sizeof dataClass),
+                 attribute(CKA_TOKEN, &no, sizeof no),
+                 attribute(CKA_LABEL, kObjectLabel, sizeof kObjectLabel - 1),
+                 attribute(CKA_VALUE, kObjectValue, sizeof kObjectValue - 1),
+             };
+             expectRv("C_CreateObject", c.f->C_CreateObject(c.session, object, 4, &c.object),
+                      CKR_OK);
+             // Handles above 32 bits: a truncating hop would hand back another.
+             expectTrue(c.object > 0xFFFFFFFFUL, "object handle " + std::to_string(c.object));
+         }},
+        {"C_GetObjectSize",
+         [](Context& c) {
+             CK_ULONG size = 0;
+             expectRv("C_GetObjectSize", c.f->C_GetObjectSize(c.session, c.object, &size), CKR_OK);
+             expectTrue(size > 0, "object size 0");
+         }},
+        {"C_GetAttributeValue",
+         [](Context& c) {
+             expectTrue(readAttribute(c, c.object, CKA_LABEL) == kObjectLabel, "label");
+             expectTrue(readAttribute(c, c.object, CKA_VALUE) == kObjectValue, "value");
+         }},
+        {"C_SetAttributeValue",
+         [](Context& c) {
+             const char label[] = "renamed";
+             CK_ATTRIBUTE change = attribute(CKA_LABEL, label, sizeof label - 1);
+             expectRv("C_SetAttributeValue",
+                      c.f->C_SetAttributeValue(c.session, c.object, &change, 1), CKR_OK);
+             expectTrue(readAttribute(c, c.object, CKA_LABEL) == label, "label not changed");
+         }},
+        {"C_CopyObject",
+         [](Context& c) {
+             const char label[] = "copy";
+             CK_ATTRIBUTE change = attribute(CKA_LABEL, label, sizeof label - 1);
+             expectRv("C_CopyObject", c.f->C_CopyObject(c.session, c.object, &change, 1, &c.copy),
+                      CKR_OK);
+             expectTrue(c.copy != CK_INVALID_HANDLE && c.copy != c.object, "copy handle");
+             expectTrue(readAttribute(c, c.copy, CKA_VALUE) == kObjectValue, "copied value");
+         }},
+        {"C_FindObjectsInit/C_FindObjects/C_FindObjectsFinal",
+         [](Context& c) {
+             CK_OBJECT_CLASS dataClass = CKO_DATA;
+             CK_ATTRIBUTE filter = attribute(CKA_CLASS, &dataClass, sizeof dataClass);
+             expectRv("C_FindObjectsInit", c.f->C_FindObjectsInit(c.session, &filter, 1), CKR_OK);
+             CK_OBJECT_HANDLE found[10] = {0};
+             CK_ULONG count = 0;
+             expectRv("C_FindObjects", c.f->C_FindObjects(c.session, found, 10, &count), CKR_OK);
+             std::vector<CK_OBJECT_HANDLE> handles(found, found + std::min<CK_ULONG>(count, 10));
+             std::sort(handles.begin(), handles.end());
+             std::vector<CK_OBJECT_HANDLE> expected = {c.object, c.copy};
+             std::sort(expected.begin(), expected.end());
+             expectTrue(handles == expected, "found " + std::to_string(count) + " objects");
+             expectRv("C_FindObjectsFinal", c.f->C_FindObjectsFinal(c.session), CKR_OK);
+         }},
+        {"C_DestroyObject",
+         [](Context& c) {
+             expectRv("C_DestroyObject", c.f->C_DestroyObject(c.session, c.copy), CKR_OK);
+             CK_ULONG size = 0;
+             expectRv("C_GetObjectSize (destroyed)", c.f->C_GetObjectSize(c.session, c.copy, &size),
+                      CKR_OBJECT_HANDLE_INVALID);
+         }},
+        {"C_GetOperationState",
+         [](Context& c) {
+             // No operation is active yet; the buffer goes out as a C string.
+             CK_BYTE state[64] = {0};
+             CK_ULONG length = sizeof state;
+             expectRv("C_GetOperationState", c.f->C_GetOperationState(c.session, state, &length),
+                      CKR_OPERATION_NOT_INITIALIZED);
+         }},
+        {"C_SetOperationState",
+         [](Context& c) {
+             CK_BYTE junk[] = {1, 2, 3, 4};
+             expectRv("C_SetOperationState",
+                      c.f->C_SetOperationState(c.session, junk, sizeof junk, CK_INVALID_HANDLE,
+                                               CK_INVALID_HANDLE),
+                      CKR_SAVED_STATE_INVALID);
+         }},
+        {"C_Logout",
+         [](Context& c) {
+             expectRv("C_Logout", c.f->C_Logout(c.session), CKR_OK);
+             expectTrue(sessionState(c) == CKS_RW_PUBLIC_SESSION, "still logged in");
+         }},
+        {"C_CloseSession",
+         [](Context& c) {
+             expectRv("C_CloseSession", c.f->C_CloseSession(c.session), CKR_OK);
+             CK_SESSION_INFO info{};
+             expectRv("C_GetSessionInfo (closed)", c.f->C_GetSessionInfo(c.session, &info),
+                      CKR_SESSION_HANDLE_INVALID);
+         }},
+        {"C_CloseAllSessions",
+         [](Context& c) {
+             CK_SESSION_HANDLE first = CK_INVALID_HANDLE, second = CK_INVALID_HANDLE;
+             expectRv("C_OpenSession",
+                      c.f->C_OpenSession(1, CKF_SERIAL_SESSION, nullptr, nullptr, &first), CKR_OK);
+             expectRv("C_OpenSession",
+                      c.f->C_OpenSession(1, CKF_SERIAL_SESSION, nullptr, nullptr, &second), CKR_OK);
+             expectRv("C_CloseAllSessions", c.f->C_CloseAllSessions(1), CKR_OK);
+             CK_SESSION_INFO info{};
+             expectRv("C_GetSessionInfo (closed)", c.f->C_GetSessionInfo(second, &info),
+                      CKR_SESSION_HANDLE_INVALID);
+         }},
+        {"C_Finalize",
+         [](Context& c) { expectRv("C_Finalize", c.f->C_Finalize(nullptr), CKR_OK); }},
+    };
+    return table;
+}
+
+int runSteps(const Library& library, bool alreadyInitialized) {
+    Context context;
+    context.f = library.functions;
+    context.alreadyInitialized = alreadyInitialized;
+    int failures = 0;
+    for (const Step& step : steps()) {
+        try {
+            step.run(context);
+            std::cout << "ok " << step.name << std::endl;
+        } catch (const Failure& failure) {
+            std::cout << "FAIL " << step.name << ": " << failure.why << std::endl;
+            ++failures;
+        }
+    }
+    return failures == 0 ? 0 : 1;
+}
+
+// ---- Single calls on request ------------------------------------------------------
+
+int runCalls(const Library& library, const std::vector<std::string>& functions) {
+    std::cout << "connected" << std::endl;
+    CK_FUNCTION_LIST_PTR f = library.functions;
+    for (const std::string& function : functions) {
+        std::string line;
+        if (!std::getline(std::cin, line)) return 1;
+        std::cout << "calling " << function << std::endl;
+        auto start = std::chrono::steady_clock::now();
+        CK_RV rv;
+        CK_INFO info{};
+        if (function == "C_Initialize")
+            rv = f->C_Initialize(nullptr);
+        else if (function == "C_GetInfo")
+            rv = f->C_GetInfo(&info);
+        else if (function == "C_Finalize")
+            rv = f->C_Finalize(nullptr);
+        else
+            return 2;
+        auto elapsed = std::chrono::duration_cast<std::chrono::milliseconds>(
+            std::chrono::steady_clock::now() - start);
+        std::cout << function << " rv=" << hexRv(rv) << " ms=" << elapsed.count() << std::endl;
+    }
+    return 0;
+}
+
+// ---- A request that never completes ---------------------------------------------
+
+bool sendAll(int fd, const void* data, size_t size) {
+    const auto* p = static_cast<const char*>(data);
+    while (size > 0) {
+        ssize_t sent = send(fd, p, size, MSG_NOSIGNAL);
+        if (sent <= 0) return false;
+        p += sent;
+        size -= static_cast<size_t>(sent);
+    }
+    return true;
+}
+
+// The service's socket: an abstract name made of the id from its second
+// character on, zero-padded to the full address length.
+int connectRaw(const std::string& serverId) {
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    std::strncpy(address.sun_path, serverId.c_str(), sizeof address.sun_path - 1);
+    address.sun_path[0] = 0;
+    for (int attempt = 0; attempt < 100; ++attempt) {
+        int fd = socket(AF_UNIX, SOCK_STREAM, 0);
+        if (fd < 0) return -1;
+        if (connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) == 0) return fd;
+        close(fd);
+        std::this_thread::sleep_for(std::chrono::milliseconds(100));
+    }
+    return -1;
+}
+
+int stall(const std::string& serverId) {
+    int fd = connectRaw(serverId);
+    if (fd < 0) {
+        std::cout << "FAIL connect" << std::endl;
+        return 2;
+    }
+    // A PKCS#11 command announcing 16 bytes of which only 8 ever come: the
+    // service has taken the request in and waits for the rest.
+    const int32_t header[4] = {101, 103, 0, 16};
+    const char half[8] = {0};
+    if (!sendAll(fd, header, sizeof header) || !sendAll(fd, half, sizeof half)) {
+        std::cout << "FAIL send" << std::endl;
+        return 2;
+    }
+    std::cout << "stalled" << std::endl;
+    std::string line;
+    while (std::getline(std::cin, line)) {
+    }
+    close(fd);
+    return 0;
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+    std::vector<std::string> args(argv + 1, argv + argc);
+    if (args.size() < 3) {
+        std::cerr << "usage: vok_e2e_client <library> <serverId> steps [--already-initialized]\n"
+                     "       vok_e2e_client <library> <serverId> call <function>...\n"
+                     "       vok_e2e_client <library> <serverId> stall\n";
+        return 2;
+    }
+    const std::string& mode = args[2];
+    if (mode == "stall") return stall(args[1]);
+    if (mode == "steps") {
+        bool alreadyInitialized = args.size() > 3 && args[3] == "--already-initialized";
+        return runSteps(openLibrary(args[0].c_str(), args[1].c_str()), alreadyInitialized);
+    }
+    if (mode == "call")
+        return runCalls(openLibrary(args[0].c_str(), args[1].c_str()),
+                        std::vector<std::string>(args.begin() + 3, args.end()));
+    std::cerr << "unknown mode " << mode << "\n";
+    return 2;
+}

@@ -1,0 +1,324 @@
+// Two real processes across a real socket: the Java service host serving the
+// fake vendor module, and native client processes that load the proxy
+// library. The cases kill one side in the middle of a call.
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <poll.h>
+#include <signal.h>
+#include <sys/syscall.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <cstdlib>
+#include <fstream>
+#include <memory>
+#include <string>
+#include <thread>
+#include <vector>
+
+namespace {
+
+using namespace std::chrono_literals;
+using Clock = std::chrono::steady_clock;
+
+// A child process with its standard input and output on pipes; standard
+// error goes where the test's goes.
+class Process {
+public:
+    explicit Process(const std::vector<std::string>& argv) {
+        int in[2], out[2];
+        if (pipe2(in, O_CLOEXEC) != 0 || pipe2(out, O_CLOEXEC) != 0) return;
+        pid_ = fork();
+        if (pid_ == 0) {
+            dup2(in[0], STDIN_FILENO);
+            dup2(out[1], STDOUT_FILENO);
+            std::vector<char*> args;
+            for (const std::string& a : argv) args.push_back(const_cast<char*>(a.c_str()));
+            args.push_back(nullptr);
+            execv(args[0], args.data());
+            _exit(127);
+        }
+        close(in[0]);
+        close(out[1]);
+        input_ = in[1];
+        output_ = out[0];
+    }
+    ~Process() {
+        if (running()) {
+            kill(pid_, SIGKILL);
+            waitpid(pid_, nullptr, 0);
+        }
+        closeInput();
+        if (output_ >= 0) close(output_);
+    }
+    Process(const Process&) = delete;
+    Process& operator=(const Process&) = delete;
+
+    pid_t pid() const { return pid_; }
+    bool running() const { return pid_ > 0 && !exited_; }
+
+    // The next line of output, or false at end of output or after `limit`.
+    bool readLine(std::string* line, std::chrono::milliseconds limit = 30s) {
+        const auto deadline = Clock::now() + limit;
+        for (;;) {
+            size_t end = buffer_.find('\n');
+            if (end != std::string::npos) {
+                *line = buffer_.substr(0, end);
+                buffer_.erase(0, end + 1);
+                lines_.push_back(*line);
+                return true;
+            }
+            auto left =
+                std::chrono::duration_cast<std::chrono::milliseconds>(deadline - Clock::now());
+            if (left.count() <= 0) return false;
+            pollfd p{output_, POLLIN, 0};
+            if (poll(&p, 1, static_cast<int>(left.count())) <= 0) continue;
+            char chunk[512];
+            ssize_t n = read(output_, chunk, sizeof chunk);
+            if (n <= 0) return false;
+            buffer_.append(chunk, static_cast<size_t>(n));
+        }
+    }
+
+    // Reads lines until one starts with `prefix`; returns it, or "" when none came.
+    std::string waitForLine(const std::string& prefix, std::chrono::milliseconds limit = 30s) {
+        const auto deadline = Clock::now() + limit;
+        std::string line;
+        while (readLine(
+            &line, std::chrono::duration_cast<std::chrono::milliseconds>(deadline - Clock::now())))
+            if (line.compare(0, prefix.size(), prefix) == 0) return line;
+        return "";
+    }
+
+    // Every line read so far, for failure messages.
+    std::string transcript() const {
+        std::string all;
+        for (const std::string& l : lines_) all += "  " + l + "\n";
+        return all;
+    }
+
+    bool writeLine(const std::string& line) {
+        std::string text = line + "\n";
+        return input_ >= 0 &&
+               write(input_, text.data(), text.size()) == static_cast<ssize_t>(text.size());
+    }
+    void closeInput() {
+        if (input_ >= 0) close(input_);
+        input_ = -1;
+    }
+    void signal(int sig) { kill(pid_, sig); }
+
+    // The exit status (as waitpid gives it), or -1 when it is still running after `limit`.
+    int wait(std::chrono::milliseconds limit = 30s) {
+        const auto deadline = Clock::now() + limit;
+        while (!exited_) {
+            int status = 0;
+            pid_t done = waitpid(pid_, &status, WNOHANG);
+            if (done == pid_) {
+                exited_ = true;
+                status_ = status;
+            } else if (Clock::now() > deadline) {
+                return -1;
+            } else {
+                std::this_thread::sleep_for(10ms);
+            }
+        }
+        return status_;
+    }
+
+    // Stops the process and waits until every one of its threads has stopped:
+    // the stop reaches each thread on its own.
+    ::testing::AssertionResult stop(std::chrono::milliseconds limit = 10s) {
+        kill(pid_, SIGSTOP);
+        const auto deadline = Clock::now() + limit;
+        const std::string tasks = "/proc/" + std::to_string(pid_) + "/task";
+        while (Clock::now() < deadline) {
+            bool allStopped = true;
+            if (DIR* dir = opendir(tasks.c_str())) {
+                while (dirent* entry = readdir(dir)) {
+                    if (entry->d_name[0] == '.') continue;
+                    std::ifstream stat(tasks + "/" + entry->d_name + "/stat");
+                    std::string line;
+                    std::getline(stat, line);
+                    size_t end = line.rfind(')');
+                    if (end != std::string::npos && end + 2 < line.size() && line[end + 2] != 'T')
+                        allStopped = false;
+                }
+                closedir(dir);
+            }
+            if (allStopped) return ::testing::AssertionSuccess();
+            std::this_thread::sleep_for(5ms);
+        }
+        return ::testing::AssertionFailure() << "process " << pid_ << " did not stop";
+    }
+
+    // Waits until the process sleeps in one of the given system calls.
+    ::testing::AssertionResult waitBlockedIn(const std::vector<long>& calls,
+                                             std::chrono::milliseconds limit = 10s) {
+        const auto deadline = Clock::now() + limit;
+        std::string last;
+        while (Clock::now() < deadline) {
+            std::ifstream in("/proc/" + std::to_string(pid_) + "/syscall");
+            std::getline(in, last);
+            long number = std::atol(last.c_str());
+            for (long c : calls)
+                if (c == number && !last.empty()) return ::testing::AssertionSuccess();
+            std::this_thread::sleep_for(5ms);
+        }
+        std::ifstream stat("/proc/" + std::to_string(pid_) + "/stat");
+        std::string state;
+        std::getline(stat, state);
+        std::string more;
+        while (readLine(&more, 200ms)) {
+        }
+        return ::testing::AssertionFailure() << "still in system call: " << last << "\n"
+                                             << state << "\n"
+                                             << transcript();
+    }
+
+private:
+    pid_t pid_ = -1;
+    int input_ = -1;
+    int output_ = -1;
+    bool exited_ = false;
+    int status_ = 0;
+    std::string buffer_;
+    std::vector<std::string> lines_;
+};
+
+bool exitedWith(int status, int code) {
+    return status >= 0 && WIFEXITED(status) && WEXITSTATUS(status) == code;
+}
+
+const std::vector<long>& receiveCalls() {
+    static const std::vector<long> calls = {
+#ifdef SYS_recvfrom
+        SYS_recvfrom,
+#endif
+#ifdef SYS_recv
+        SYS_recv,
+#endif
+    };
+    return calls;
+}
+
+const std::string kAllOnes = "rv=0xffffffffffffffff";
+
+class ServiceE2eTest : public ::testing::Test {
+protected:
+    void SetUp() override {
+        const auto* info = ::testing::UnitTest::GetInstance()->current_test_info();
+        // The first character never reaches the socket's name.
+        serverId_ = std::string("Xvok-e2e-") + std::to_string(getpid()) + "-" + info->name();
+        host_.reset(new Process(
+            {VOK_E2E_JAVA, "-Djava.library.path=" + directoryOf(VOK_E2E_WRAPPER), "-cp",
+             VOK_E2E_JAR, "com.vok.smartcard.pkcs11.ServiceHost", serverId_, VOK_E2E_FAKE_VENDOR}));
+        ASSERT_EQ(host_->waitForLine("serving"), "serving " + serverId_) << host_->transcript();
+    }
+
+    static std::string directoryOf(const std::string& path) {
+        return path.substr(0, path.rfind('/'));
+    }
+
+    std::unique_ptr<Process> client(const std::vector<std::string>& args) {
+        std::vector<std::string> argv = {VOK_E2E_CLIENT, VOK_E2E_WRAPPER, serverId_};
+        argv.insert(argv.end(), args.begin(), args.end());
+        return std::unique_ptr<Process>(new Process(argv));
+    }
+
+    // Runs the whole step table in a new client process.
+    void expectEveryStepPasses(const std::vector<std::string>& extra = {}) {
+        std::vector<std::string> args = {"steps"};
+        args.insert(args.end(), extra.begin(), extra.end());
+        auto steps = client(args);
+        std::string line;
+        int passed = 0;
+        while (steps->readLine(&line))
+            if (line.compare(0, 3, "ok ") == 0) ++passed;
+        EXPECT_TRUE(exitedWith(steps->wait(), 0)) << steps->transcript();
+        EXPECT_GT(passed, 0) << steps->transcript();
+    }
+
+    long long usage() {
+        EXPECT_TRUE(host_->writeLine("usage"));
+        std::string line = host_->waitForLine("usage ");
+        return line.empty() ? 0 : std::atoll(line.c_str() + 6);
+    }
+
+    std::string serverId_;
+    std::unique_ptr<Process> host_;
+};
+
+TEST_F(ServiceE2eTest, ServesEveryStepToANativeClientAndStopsWhenItsInputEnds) {
+    EXPECT_EQ(usage(), 0) << "no traffic yet";
+    expectEveryStepPasses();
+    EXPECT_GT(usage(), 0);
+
+    host_->closeInput();
+    EXPECT_EQ(host_->waitForLine("stopped"), "stopped " + serverId_) << host_->transcript();
+    EXPECT_TRUE(exitedWith(host_->wait(), 0));
+}
+
+TEST_F(ServiceE2eTest, KeepsServingAfterAClientIsKilledWhileItsCallIsServed) {
+    auto victim = client({"call", "C_Initialize"});
+    ASSERT_EQ(victim->waitForLine("connected"), "connected") << victim->transcript();
+
+    // The service is held still so that the request is sent and the victim
+    // waits for the answer when it dies; the answer then meets a closed socket.
+    ASSERT_TRUE(host_->stop());
+    victim->writeLine("go");
+    ASSERT_FALSE(victim->waitForLine("calling").empty());
+    ASSERT_TRUE(victim->waitBlockedIn(receiveCalls()));
+    victim->signal(SIGKILL);
+    victim->wait();
+    host_->signal(SIGCONT);
+
+    // The victim's C_Initialize reached the module before the service noticed.
+    expectEveryStepPasses({"--already-initialized"});
+    EXPECT_TRUE(host_->running());
+}
+
+TEST_F(ServiceE2eTest, KeepsServingAfterAClientIsKilledHalfwayThroughItsRequest) {
+    auto staller = client({"stall"});
+    ASSERT_EQ(staller->waitForLine("stalled"), "stalled") << staller->transcript();
+    // The request has been taken in and never answered: -1 in the Java long.
+    EXPECT_EQ(usage(), -1);
+
+    staller->signal(SIGKILL);
+    staller->wait();
+    expectEveryStepPasses();
+    EXPECT_GT(usage(), 0);
+}
+
+TEST_F(ServiceE2eTest, ClientGetsAllOnesAtOnceWhenTheServiceIsKilledDuringACall) {
+    auto caller = client({"call", "C_Initialize", "C_GetInfo", "C_GetInfo"});
+    ASSERT_EQ(caller->waitForLine("connected"), "connected") << caller->transcript();
+    caller->writeLine("go");
+    ASSERT_EQ(caller->waitForLine("C_Initialize").substr(0, 19), "C_Initialize rv=0x0")
+        << caller->transcript();
+
+    ASSERT_TRUE(host_->stop());
+    caller->writeLine("go");
+    ASSERT_FALSE(caller->waitForLine("calling").empty());
+    ASSERT_TRUE(caller->waitBlockedIn(receiveCalls()));
+    host_->signal(SIGKILL);
+    host_->wait();
+
+    // Well inside the channel's 30-second receive timeout.
+    std::string during = caller->waitForLine("C_GetInfo", 25s);
+    EXPECT_NE(during.find(kAllOnes), std::string::npos) << caller->transcript();
+    size_t ms = during.find("ms=");
+    ASSERT_NE(ms, std::string::npos) << caller->transcript();
+    EXPECT_LT(std::atoi(during.c_str() + ms + 3), 5000) << during;
+
+    // The channel stays broken: the next call fails the same way.
+    caller->writeLine("go");
+    std::string after = caller->waitForLine("C_GetInfo", 25s);
+    EXPECT_NE(after.find(kAllOnes), std::string::npos) << caller->transcript();
+    EXPECT_TRUE(exitedWith(caller->wait(), 0));
+}
+
+}  // namespace
