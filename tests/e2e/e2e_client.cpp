@@ -92,6 +92,9 @@ struct Context {
     CK_SESSION_HANDLE session = CK_INVALID_HANDLE;
     CK_OBJECT_HANDLE object = CK_INVALID_HANDLE;
     CK_OBJECT_HANDLE copy = CK_INVALID_HANDLE;
+    CK_OBJECT_HANDLE aes = CK_INVALID_HANDLE, secret = CK_INVALID_HANDLE;
+    CK_OBJECT_HANDLE publicKey = CK_INVALID_HANDLE, privateKey = CK_INVALID_HANDLE;
+    std::string ciphertext, digest, signature;
 };
 
 // A step fails with a Failure: the rv of a call or an output was not as expected.
@@ -139,6 +142,28 @@ CK_ULONG sessionState(Context& c) {
     return info.state;
 }
 
+std::string text(const CK_BYTE* bytes, CK_ULONG length) {
+    return std::string(reinterpret_cast<const char*>(bytes), length);
+}
+
+// A final that has nothing left to return.
+void finish(Context& c, const char* name, CK_C_EncryptFinal call) {
+    CK_BYTE last[32] = {0};
+    CK_ULONG length = sizeof last;
+    expectRv(name, call(c.session, last, &length), CKR_OK);
+    expectTrue(length == 0, std::string(name) + " returned bytes");
+}
+
+// Runs an in/out data function on `input` into a 32-byte buffer.
+std::string update(Context& c, const char* name, CK_C_EncryptUpdate call,
+                   const std::string& input) {
+    std::vector<CK_BYTE> in(input.begin(), input.end());
+    CK_BYTE out[32] = {0};
+    CK_ULONG length = sizeof out;
+    expectRv(name, call(c.session, in.data(), in.size(), out, &length), CKR_OK);
+    return text(out, std::min<CK_ULONG>(length, sizeof out));
+}
+
 struct Step {
     const char* name;
     std::function<void(Context&)> run;  // throws Failure
@@ -147,6 +172,11 @@ struct Step {
 const char kUserPin[] = "1234";
 const char kObjectLabel[] = "e2e data";
 const char kObjectValue[] = "hello";
+const std::string kPlain = "sixteen byte msg";
+CK_BYTE kIv[16] = {1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 13, 14, 15, 16};
+CK_MECHANISM kCbc = {CKM_AES_CBC, kIv, sizeof kIv};
+CK_MECHANISM kSha256 = {CKM_SHA256, nullptr, 0};
+CK_MECHANISM kHmac = {CKM_MD5_HMAC, nullptr, 0};
 
 // The table, in the order a real application would call. Every function the
 // service can serve has a step; new handlers get theirs here.
@@ -339,6 +369,214 @@ const std::vector<Step>& steps() {
                       c.f->C_SetOperationState(c.session, junk, sizeof junk, CK_INVALID_HANDLE,
                                                CK_INVALID_HANDLE),
                       CKR_SAVED_STATE_INVALID);
+         }},
+        {"C_GenerateKey/C_GenerateKeyPair",
+         [](Context& c) {
+             CK_ULONG length = 16, bits = 512;
+             CK_ATTRIBUTE valueLen = attribute(CKA_VALUE_LEN, &length, sizeof length);
+             CK_ATTRIBUTE modulusBits = attribute(CKA_MODULUS_BITS, &bits, sizeof bits);
+             CK_MECHANISM aes = {CKM_AES_KEY_GEN, nullptr, 0};
+             CK_MECHANISM secret = {CKM_GENERIC_SECRET_KEY_GEN, nullptr, 0};
+             CK_MECHANISM rsa = {CKM_RSA_PKCS_KEY_PAIR_GEN, nullptr, 0};
+             expectRv("C_GenerateKey", c.f->C_GenerateKey(c.session, &aes, &valueLen, 1, &c.aes),
+                      CKR_OK);
+             expectRv("C_GenerateKey",
+                      c.f->C_GenerateKey(c.session, &secret, &valueLen, 1, &c.secret), CKR_OK);
+             expectRv("C_GenerateKeyPair",
+                      c.f->C_GenerateKeyPair(c.session, &rsa, &modulusBits, 1, nullptr, 0,
+                                             &c.publicKey, &c.privateKey),
+                      CKR_OK);
+             expectTrue(c.aes > 0xFFFFFFFFUL && c.privateKey > c.publicKey, "key handles");
+         }},
+        {"C_EncryptInit/C_Encrypt",
+         [](Context& c) {
+             expectRv("C_EncryptInit", c.f->C_EncryptInit(c.session, &kCbc, c.aes), CKR_OK);
+             c.ciphertext = update(c, "C_Encrypt", c.f->C_Encrypt, kPlain);
+             expectTrue(c.ciphertext.size() == 16 && c.ciphertext != kPlain, "ciphertext");
+         }},
+        // The PKCS#11 two-call form: the length first, then the data.
+        {"C_DecryptInit/C_Decrypt",
+         [](Context& c) {
+             expectRv("C_DecryptInit", c.f->C_DecryptInit(c.session, &kCbc, c.aes), CKR_OK);
+             std::vector<CK_BYTE> in(c.ciphertext.begin(), c.ciphertext.end());
+             CK_ULONG length = 0;
+             expectRv("C_Decrypt (length)",
+                      c.f->C_Decrypt(c.session, in.data(), in.size(), nullptr, &length), CKR_OK);
+             expectTrue(length == 16, "decrypted length " + std::to_string(length));
+             std::vector<CK_BYTE> out(length);
+             expectRv("C_Decrypt",
+                      c.f->C_Decrypt(c.session, in.data(), in.size(), out.data(), &length), CKR_OK);
+             expectTrue(text(out.data(), length) == kPlain, "round trip");
+         }},
+        // A length query on an update sends capacity 0, and the service still
+        // hands the module the whole input.
+        {"C_EncryptUpdate/C_EncryptFinal/C_DecryptUpdate/C_DecryptFinal",
+         [](Context& c) {
+             expectRv("C_EncryptInit", c.f->C_EncryptInit(c.session, &kCbc, c.aes), CKR_OK);
+             std::vector<CK_BYTE> in(kPlain.begin(), kPlain.end());
+             CK_ULONG length = 0;
+             expectRv("C_EncryptUpdate (length)",
+                      c.f->C_EncryptUpdate(c.session, in.data(), in.size(), nullptr, &length),
+                      CKR_OK);
+             expectTrue(length == 16, "update length " + std::to_string(length));
+             expectTrue(update(c, "C_EncryptUpdate", c.f->C_EncryptUpdate, kPlain) == c.ciphertext,
+                        "multi-part ciphertext");
+             finish(c, "C_EncryptFinal", c.f->C_EncryptFinal);
+             expectRv("C_DecryptInit", c.f->C_DecryptInit(c.session, &kCbc, c.aes), CKR_OK);
+             expectTrue(update(c, "C_DecryptUpdate", c.f->C_DecryptUpdate, c.ciphertext) == kPlain,
+                        "multi-part plaintext");
+             finish(c, "C_DecryptFinal", c.f->C_DecryptFinal);
+         }},
+        {"C_DigestInit/C_Digest/C_DigestUpdate/C_DigestKey/C_DigestFinal",
+         [](Context& c) {
+             expectRv("C_DigestInit", c.f->C_DigestInit(c.session, &kSha256), CKR_OK);
+             c.digest = update(c, "C_Digest", c.f->C_Digest, kPlain);
+             expectTrue(c.digest.size() == 32, "digest length");
+             expectRv("C_DigestInit", c.f->C_DigestInit(c.session, &kSha256), CKR_OK);
+             std::vector<CK_BYTE> in(kPlain.begin(), kPlain.end());
+             expectRv("C_DigestUpdate", c.f->C_DigestUpdate(c.session, in.data(), in.size()),
+                      CKR_OK);
+             expectRv("C_DigestKey", c.f->C_DigestKey(c.session, c.secret), CKR_OK);
+             CK_BYTE out[32] = {0};
+             CK_ULONG length = sizeof out;
+             expectRv("C_DigestFinal", c.f->C_DigestFinal(c.session, out, &length), CKR_OK);
+             expectTrue(length == 32 && text(out, length) != c.digest, "keyed digest");
+         }},
+        {"C_SignInit/C_Sign/C_SignUpdate/C_SignFinal",
+         [](Context& c) {
+             expectRv("C_SignInit", c.f->C_SignInit(c.session, &kHmac, c.secret), CKR_OK);
+             c.signature = update(c, "C_Sign", c.f->C_Sign, kPlain);
+             expectTrue(c.signature.size() == 16, "signature length");
+             expectRv("C_SignInit", c.f->C_SignInit(c.session, &kHmac, c.secret), CKR_OK);
+             std::vector<CK_BYTE> in(kPlain.begin(), kPlain.end());
+             expectRv("C_SignUpdate", c.f->C_SignUpdate(c.session, in.data(), in.size()), CKR_OK);
+             CK_BYTE out[16] = {0};
+             CK_ULONG length = sizeof out;
+             expectRv("C_SignFinal", c.f->C_SignFinal(c.session, out, &length), CKR_OK);
+             expectTrue(text(out, length) == c.signature, "multi-part signature");
+         }},
+        // C_Verify's signature never reaches the module (the service checks a
+        // zero-filled one), so only the multi-part form can succeed.
+        {"C_VerifyInit/C_Verify/C_VerifyUpdate/C_VerifyFinal",
+         [](Context& c) {
+             std::vector<CK_BYTE> in(kPlain.begin(), kPlain.end());
+             std::vector<CK_BYTE> signature(c.signature.begin(), c.signature.end());
+             expectRv("C_VerifyInit", c.f->C_VerifyInit(c.session, &kHmac, c.secret), CKR_OK);
+             expectRv(
+                 "C_Verify",
+                 c.f->C_Verify(c.session, in.data(), in.size(), signature.data(), signature.size()),
+                 CKR_SIGNATURE_INVALID);
+             signature.assign(c.signature.begin(), c.signature.end());
+             expectRv("C_VerifyInit", c.f->C_VerifyInit(c.session, &kHmac, c.secret), CKR_OK);
+             expectRv("C_VerifyUpdate", c.f->C_VerifyUpdate(c.session, in.data(), in.size()),
+                      CKR_OK);
+             expectRv("C_VerifyFinal",
+                      c.f->C_VerifyFinal(c.session, signature.data(), signature.size()), CKR_OK);
+         }},
+        {"C_SignRecoverInit/C_SignRecover/C_VerifyRecoverInit/C_VerifyRecover",
+         [](Context& c) {
+             CK_MECHANISM x509 = {CKM_RSA_X_509, nullptr, 0};
+             expectRv("C_SignRecoverInit", c.f->C_SignRecoverInit(c.session, &x509, c.privateKey),
+                      CKR_OK);
+             const std::string recoverable = update(c, "C_SignRecover", c.f->C_SignRecover, kPlain);
+             expectTrue(recoverable.size() == 17, "recoverable signature length");
+             expectRv("C_VerifyRecoverInit",
+                      c.f->C_VerifyRecoverInit(c.session, &x509, c.publicKey), CKR_OK);
+             expectTrue(update(c, "C_VerifyRecover", c.f->C_VerifyRecover, recoverable) == kPlain,
+                        "recovered data");
+         }},
+        {"C_DigestEncryptUpdate/C_DecryptDigestUpdate/C_SignEncryptUpdate/C_DecryptVerifyUpdate",
+         [](Context& c) {
+             auto finalBytes = [&c](const char* name, CK_C_DigestFinal call) {
+                 CK_BYTE out[32] = {0};
+                 CK_ULONG length = sizeof out;
+                 expectRv(name, call(c.session, out, &length), CKR_OK);
+                 return text(out, std::min<CK_ULONG>(length, sizeof out));
+             };
+             expectRv("C_DigestInit", c.f->C_DigestInit(c.session, &kSha256), CKR_OK);
+             expectRv("C_EncryptInit", c.f->C_EncryptInit(c.session, &kCbc, c.aes), CKR_OK);
+             expectTrue(update(c, "C_DigestEncryptUpdate", c.f->C_DigestEncryptUpdate, kPlain) ==
+                            c.ciphertext,
+                        "digest-encrypt ciphertext");
+             finish(c, "C_EncryptFinal", c.f->C_EncryptFinal);
+             expectTrue(finalBytes("C_DigestFinal", c.f->C_DigestFinal) == c.digest,
+                        "digest-encrypt digest");
+             expectRv("C_DecryptInit", c.f->C_DecryptInit(c.session, &kCbc, c.aes), CKR_OK);
+             expectRv("C_DigestInit", c.f->C_DigestInit(c.session, &kSha256), CKR_OK);
+             expectTrue(update(c, "C_DecryptDigestUpdate", c.f->C_DecryptDigestUpdate,
+                               c.ciphertext) == kPlain,
+                        "decrypt-digest plaintext");
+             finish(c, "C_DecryptFinal", c.f->C_DecryptFinal);
+             expectTrue(finalBytes("C_DigestFinal", c.f->C_DigestFinal) == c.digest,
+                        "decrypt-digest digest");
+             expectRv("C_SignInit", c.f->C_SignInit(c.session, &kHmac, c.secret), CKR_OK);
+             expectRv("C_EncryptInit", c.f->C_EncryptInit(c.session, &kCbc, c.aes), CKR_OK);
+             expectTrue(
+                 update(c, "C_SignEncryptUpdate", c.f->C_SignEncryptUpdate, kPlain) == c.ciphertext,
+                 "sign-encrypt ciphertext");
+             finish(c, "C_EncryptFinal", c.f->C_EncryptFinal);
+             expectTrue(finalBytes("C_SignFinal", c.f->C_SignFinal) == c.signature,
+                        "sign-encrypt signature");
+             expectRv("C_DecryptInit", c.f->C_DecryptInit(c.session, &kCbc, c.aes), CKR_OK);
+             expectRv("C_VerifyInit", c.f->C_VerifyInit(c.session, &kHmac, c.secret), CKR_OK);
+             expectTrue(update(c, "C_DecryptVerifyUpdate", c.f->C_DecryptVerifyUpdate,
+                               c.ciphertext) == kPlain,
+                        "decrypt-verify plaintext");
+             finish(c, "C_DecryptFinal", c.f->C_DecryptFinal);
+             std::vector<CK_BYTE> signature(c.signature.begin(), c.signature.end());
+             expectRv("C_VerifyFinal",
+                      c.f->C_VerifyFinal(c.session, signature.data(), signature.size()), CKR_OK);
+         }},
+        {"C_WrapKey/C_UnwrapKey/C_DeriveKey",
+         [](Context& c) {
+             CK_MECHANISM ecb = {CKM_AES_ECB, nullptr, 0};
+             CK_ULONG length = 0;
+             expectRv("C_WrapKey (length)",
+                      c.f->C_WrapKey(c.session, &ecb, c.aes, c.secret, nullptr, &length), CKR_OK);
+             std::vector<CK_BYTE> wrapped(length);
+             expectRv("C_WrapKey",
+                      c.f->C_WrapKey(c.session, &ecb, c.aes, c.secret, wrapped.data(), &length),
+                      CKR_OK);
+             CK_OBJECT_CLASS secretClass = CKO_SECRET_KEY;
+             CK_ATTRIBUTE tmpl = attribute(CKA_CLASS, &secretClass, sizeof secretClass);
+             CK_OBJECT_HANDLE unwrapped = CK_INVALID_HANDLE, derived = CK_INVALID_HANDLE;
+             expectRv("C_UnwrapKey",
+                      c.f->C_UnwrapKey(c.session, &ecb, c.aes, wrapped.data(), length, &tmpl, 1,
+                                       &unwrapped),
+                      CKR_OK);
+             expectTrue(
+                 readAttribute(c, unwrapped, CKA_VALUE) == readAttribute(c, c.secret, CKA_VALUE),
+                 "unwrapped value");
+             // Answered as "C_UnDeriveKey", which the proxy does not mind.
+             CK_MECHANISM derivation = {CKM_SHA256_KEY_DERIVATION, nullptr, 0};
+             expectRv("C_DeriveKey",
+                      c.f->C_DeriveKey(c.session, &derivation, c.secret, nullptr, 0, &derived),
+                      CKR_OK);
+             expectTrue(readAttribute(c, derived, CKA_VALUE).size() == 32, "derived value");
+         }},
+        {"C_SeedRandom/C_GenerateRandom",
+         [](Context& c) {
+             CK_BYTE seed[] = "seed";
+             CK_BYTE random[16] = {0};
+             expectRv("C_SeedRandom", c.f->C_SeedRandom(c.session, seed, 4), CKR_OK);
+             expectRv("C_GenerateRandom", c.f->C_GenerateRandom(c.session, random, sizeof random),
+                      CKR_OK);
+             expectTrue(text(random, sizeof random) != std::string(16, '\0'), "no random bytes");
+         }},
+        {"C_GetFunctionStatus/C_CancelFunction",
+         [](Context& c) {
+             expectRv("C_GetFunctionStatus", c.f->C_GetFunctionStatus(c.session),
+                      CKR_FUNCTION_NOT_PARALLEL);
+             expectRv("C_CancelFunction", c.f->C_CancelFunction(c.session),
+                      CKR_FUNCTION_NOT_PARALLEL);
+         }},
+        {"C_WaitForSlotEvent",
+         [](Context& c) {
+             CK_SLOT_ID slot = 0;
+             expectRv("C_WaitForSlotEvent", c.f->C_WaitForSlotEvent(0, &slot, nullptr), CKR_OK);
+             expectTrue(slot == 1, "event slot " + std::to_string(slot));
+             expectRv("C_WaitForSlotEvent (no block)",
+                      c.f->C_WaitForSlotEvent(CKF_DONT_BLOCK, &slot, nullptr), CKR_NO_EVENT);
          }},
         {"C_Logout",
          [](Context& c) {

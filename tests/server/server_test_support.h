@@ -8,6 +8,7 @@
 
 #include <functional>
 #include <string>
+#include <vector>
 
 #include "fake_vendor.h"
 #include "vok_proto.h"
@@ -47,6 +48,19 @@ inline void setAttribute(pkcs11::CK_ATTRIBUTE* a, CK_ATTRIBUTE_TYPE type, const 
 }
 
 inline std::string hex(const std::string& bytes) { return fakevendor::hex(bytes); }
+inline std::string zeros(size_t bytes) { return std::string(2 * bytes, '0'); }
+
+// The parameter lines of the module's record of its last call of `function`.
+inline std::vector<std::string> received(const std::string& function) {
+    const std::string text = fakevendor::lastCall(function).text;
+    std::vector<std::string> lines;
+    for (size_t start = text.find('\n') + 1, end; start != 0; start = end + 1) {
+        end = text.find('\n', start);
+        lines.push_back(text.substr(start, end - start));
+        if (end == std::string::npos) break;
+    }
+    return lines;
+}
 
 // The fake module, reset, initialised, with a logged-in read/write user
 // session on slot 1 and whatever objects a test creates through it. The
