@@ -50,5 +50,6 @@ static_assert(sizeof(CK_X9_42_DH1_DERIVE_PARAMS) == 32, "X9.42 DH1");
 static_assert(sizeof(CK_X9_42_DH2_DERIVE_PARAMS) == 60, "X9.42 DH2");
 static_assert(sizeof(CK_DES_CBC_ENCRYPT_DATA_PARAMS) == 20, "DES-CBC encrypt data");
 static_assert(sizeof(CK_AES_CBC_ENCRYPT_DATA_PARAMS) == 28, "AES-CBC encrypt data");
+static_assert(sizeof(CK_GCM_PARAMS) == 40 && sizeof(CK_CCM_PARAMS) == 40, "GCM, CCM");
 
 int main() { return 0; }
