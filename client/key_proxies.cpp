@@ -3,6 +3,7 @@
 
 #include <algorithm>
 
+#include "by_value.h"
 #include "call_frame.h"
 #include "marshal.h"
 
@@ -15,6 +16,14 @@ namespace {
 
 void copyHandle(google::protobuf::uint64 value, CK_OBJECT_HANDLE_PTR out) {
     if (out) *out = value;
+}
+
+// The new key's handle, and what the module wrote into the mechanism's
+// parameter (a PBE IV, SSL3/TLS key material) where the answer carries it.
+template <class Response>
+void copyKeyAnswer(const Response& r, CK_MECHANISM_PTR pMechanism, CK_OBJECT_HANDLE_PTR phKey) {
+    copyHandle(r.phkey(), phKey);
+    if (r.has_pparametervalue()) copyBackParameter(pMechanism, r.pparametervalue());
 }
 
 }  // namespace
@@ -32,7 +41,7 @@ CK_RV C_GenerateKey(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism,
             m->set_ulcount(ulCount);
         },
         [&](const pkcs11::OperationResult& res) {
-            if (res.has_generatekeyres()) copyHandle(res.generatekeyres().phkey(), phKey);
+            if (res.has_generatekeyres()) copyKeyAnswer(res.generatekeyres(), pMechanism, phKey);
         });
 }
 
@@ -104,7 +113,7 @@ CK_RV C_UnwrapKey(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism,
             m->set_ulattributecount(ulAttributeCount);
         },
         [&](const pkcs11::OperationResult& res) {
-            if (res.has_unwrapkeyres()) copyHandle(res.unwrapkeyres().phkey(), phKey);
+            if (res.has_unwrapkeyres()) copyKeyAnswer(res.unwrapkeyres(), pMechanism, phKey);
         });
 }
 
@@ -123,7 +132,7 @@ CK_RV C_DeriveKey(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism,
             m->set_ulattributecount(ulAttributeCount);
         },
         [&](const pkcs11::OperationResult& res) {
-            if (res.has_derivekeyres()) copyHandle(res.derivekeyres().phkey(), phKey);
+            if (res.has_derivekeyres()) copyKeyAnswer(res.derivekeyres(), pMechanism, phKey);
         });
 }
 

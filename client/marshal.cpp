@@ -1,6 +1,8 @@
 #include "marshal.h"
 
 #include <algorithm>
+
+#include "by_value.h"
 #include <cstring>
 
 #define LOG_TAG "Vokpkcs11f"
@@ -44,11 +46,12 @@ void putTemplate(AttributeList* out, const CK_ATTRIBUTE* tmpl, CK_ULONG count) {
             VOK_LOGD("passed pvalue is NULL");
         }
         if (a->has_pvalue()) VOK_LOGD("has pvalue");
+        putTemplateValue(a, tmpl[i], 0);
     }
 }
 
 void copyBackTemplate(const AttributeList& answer, CK_ULONG statedCount, CK_ATTRIBUTE* tmpl,
-                      CK_ULONG callerCount) {
+                      CK_ULONG callerCount, int depth) {
     if (!tmpl) return;
     const CK_ULONG n =
         std::min<CK_ULONG>({statedCount, static_cast<CK_ULONG>(answer.size()), callerCount});
@@ -56,6 +59,7 @@ void copyBackTemplate(const AttributeList& answer, CK_ULONG statedCount, CK_ATTR
         const pkcs11::CK_ATTRIBUTE& a = answer.Get(static_cast<int>(i));
         CK_ATTRIBUTE& mine = tmpl[i];
         mine.type = a.type();
+        if (copyBackTemplateValue(a, mine, depth)) continue;
         if (!mine.pValue) {
             mine.ulValueLen = a.ulvaluelen();  // length query
         } else if (a.has_pvalue()) {
@@ -99,6 +103,7 @@ void putMechanism(pkcs11::CK_MECHANISM* out, const CK_MECHANISM* mechanism) {
     out->set_mechanism(mechanism->mechanism);
     out->set_pparameter(bytesOf(mechanism->pParameter, mechanism->ulParameterLen));
     out->set_ulparameterlen(mechanism->ulParameterLen);
+    putParameterValue(out, *mechanism);
 }
 
 CK_RV copyBackOutput(CK_RV rv, const std::string& data, CK_ULONG statedLength,

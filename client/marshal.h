@@ -30,14 +30,16 @@ std::string cString(const void* p, CK_ULONG limit);
 std::string bytesOf(const void* p, CK_ULONG length);
 
 // Template rule, for input templates and the output template of
-// C_GetAttributeValue alike.
+// C_GetAttributeValue alike. A value that is itself a template also travels
+// by value (by_value.h).
 void putTemplate(AttributeList* out, const CK_ATTRIBUTE* tmpl, CK_ULONG count);
 
 // Template copy-back (C_GetAttributeValue, C_SetAttributeValue): types, value
 // bytes into non-NULL buffers that the answer filled, and the needed length
-// for NULL buffers.
+// for NULL buffers. Templates inside values are copied back entry by entry,
+// `depth` counting the levels.
 void copyBackTemplate(const AttributeList& answer, CK_ULONG statedCount, CK_ATTRIBUTE* tmpl,
-                      CK_ULONG callerCount);
+                      CK_ULONG callerCount, int depth = 0);
 
 // C_FindObjectsInit's copy-back: every returned attribute rewrites type, value
 // and length of the caller's entry, whether or not the answer carries a value.
@@ -49,7 +51,8 @@ void putList(NumberList* out, const CK_ULONG* list, CK_ULONG count);
 void copyBackList(const NumberList& answer, CK_ULONG statedCount, CK_ULONG* list, CK_ULONG capacity,
                   CK_ULONG* pulCount);
 
-// Mechanism rule: type and the parameter block as raw bytes, unconverted.
+// Mechanism rule: type and the parameter block as raw bytes; a parameter
+// that holds pointers also travels by value (by_value.h).
 void putMechanism(pkcs11::CK_MECHANISM* out, const CK_MECHANISM* mechanism);
 
 // Output-buffer rule, request side: the caller's buffer read as a C string

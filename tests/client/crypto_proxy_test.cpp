@@ -187,7 +187,7 @@ protected:
     TestService& service = TestService::start();
 };
 
-TEST_F(CryptoProxies, MechanismParameterTravelsByteForByte) {
+TEST_F(CryptoProxies, MechanismParameterTravelsByteForByteAndPointersByValue) {
     CK_MECHANISM noParameter{CKM_SHA256, nullptr, 0};
     ASSERT_EQ(CKR_OK, C_DigestInit(kSession, &noParameter));
     EXPECT_EQ(
@@ -198,10 +198,17 @@ TEST_F(CryptoProxies, MechanismParameterTravelsByteForByte) {
     CK_RSA_PKCS_OAEP_PARAMS oaep{CKM_SHA256, CKG_MGF1_SHA256, CKZ_DATA_SPECIFIED, label, 5};
     CK_MECHANISM withParameter{CKM_RSA_PKCS_OAEP, &oaep, sizeof(oaep)};
     ASSERT_EQ(CKR_OK, C_EncryptInit(kSession, &withParameter, kKey));
-    const std::string oaepBytes(reinterpret_cast<const char*>(&oaep), sizeof(oaep));
-    EXPECT_EQ(hex(encodeRequest(
-                  "C_EncryptInit", 14,
-                  {kSession, Field::message({CKM_RSA_PKCS_OAEP, oaepBytes, sizeof(oaep)}), kKey})),
+    // A pointer-holding parameter: its raw bytes with the pointer zeroed, and
+    // in field 100 its numbers and its one buffer, by value.
+    CK_RSA_PKCS_OAEP_PARAMS zeroed = oaep;
+    zeroed.pSourceData = nullptr;
+    const std::string oaepBytes(reinterpret_cast<const char*>(&zeroed), sizeof(zeroed));
+    Field mechanism = Field::message({CKM_RSA_PKCS_OAEP, oaepBytes, sizeof(oaep)});
+    const std::string byValue = encode(
+        {Field::repeated({CKM_SHA256, CKG_MGF1_SHA256, CKZ_DATA_SPECIFIED, 5}),
+         Field::attributes({{"label"}})});
+    mechanism.bytes += "\xa2\x06" + std::string(1, static_cast<char>(byValue.size())) + byValue;
+    EXPECT_EQ(hex(encodeRequest("C_EncryptInit", 14, {kSession, mechanism, kKey})),
               hex(service.lastRequestBytes()));
 }
 
