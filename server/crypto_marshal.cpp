@@ -18,7 +18,10 @@ void requireOneFrame(uint64_t first, uint64_t second) {
 
 NativeMechanism::NativeMechanism(const pkcs11::CK_MECHANISM& sent)
     : parameter_(fromRequest(sent.pparameter(), sent.ulparameterlen())),
-      mechanism_{sent.mechanism(), parameter_.data(), sent.ulparameterlen()} {}
+      mechanism_{sent.mechanism(), parameter_.data(), sent.ulparameterlen()},
+      copy_(ParameterCopy::of(sent)) {
+    if (copy_) mechanism_.pParameter = copy_->data(), mechanism_.ulParameterLen = copy_->size();
+}
 
 Output::Output(Bytes buffer) : buffer_(std::move(buffer)), length_(buffer_.count()) {}
 

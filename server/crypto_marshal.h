@@ -9,15 +9,16 @@
 
 #include <string>
 
+#include "by_value.h"
 #include "marshal.h"
 
 namespace vok {
 namespace server {
 
 // The client's mechanism for the module: its type, and a parameter buffer of
-// exactly ulParameterLen bytes, never NULL even for 0. The parameter is
-// passed through as bytes: a structure that holds pointers arrives with the
-// client process's pointer values, which is for the module to judge.
+// exactly ulParameterLen bytes, never NULL even for 0. Plain parameters pass
+// as bytes; a structure that holds pointers is the service's own copy, built
+// from its by-value form (by_value.h), or the call is refused.
 class NativeMechanism {
 public:
     explicit NativeMechanism(const pkcs11::CK_MECHANISM& sent);
@@ -25,9 +26,18 @@ public:
     NativeMechanism& operator=(const NativeMechanism&) = delete;
     CK_MECHANISM_PTR get() { return &mechanism_; }
 
+    // What the module wrote into the parameter's output members, for the
+    // answers of C_GenerateKey, C_UnwrapKey and C_DeriveKey; nothing for a
+    // parameter without any.
+    template <class Response>
+    void answerOutputs(Response* response) const {
+        if (copy_ && copy_->returnsOutputs()) copy_->answer(response->mutable_pparametervalue());
+    }
+
 private:
     Bytes parameter_;
     CK_MECHANISM mechanism_;
+    std::unique_ptr<ParameterCopy> copy_;
 };
 
 // A buffer the module writes, with its in/out length, which starts at the

@@ -11,5 +11,16 @@ std::string serialised(const pkcs11::OperationResult& response) {
     return bytes;
 }
 
+std::string refused(const char* responseName, CK_RV result) noexcept {
+    try {
+        pkcs11::OperationResult response;
+        response.set_name(responseName);
+        response.set_result(result);
+        return serialised(response);
+    } catch (...) {
+        return std::string();
+    }
+}
+
 }  // namespace server
 }  // namespace vok

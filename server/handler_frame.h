@@ -7,6 +7,7 @@
 
 #include <string>
 
+#include "marshal.h"
 #include "vok_server.h"
 
 namespace vok {
@@ -15,11 +16,15 @@ namespace server {
 // The serialised answer, or an empty one when it could not be framed.
 std::string serialised(const pkcs11::OperationResult& response);
 
+// The answer to a request the module was not called for: name and code only.
+std::string refused(const char* responseName, CK_RV result) noexcept;
+
 // body(pkcs11::OperationResult&) reads the request sub-message from
 // `operation`, stores the module's return value in `rv` and fills the answer's
-// sub-message whatever `rv` is. Whatever it throws (in practice sizes from the
-// request that cannot be allocated) ends in the empty answer, the one the
-// client also gets for a command nobody serves.
+// sub-message whatever `rv` is. A Refusal it throws is answered with its code;
+// whatever else it throws (in practice sizes from the request that cannot be
+// allocated) ends in the empty answer, the one the client also gets for a
+// command nobody serves.
 template <class Body>
 std::string serve(const std::string& request, const char* responseName, Body&& body) noexcept {
     try {
@@ -30,6 +35,8 @@ std::string serve(const std::string& request, const char* responseName, Body&& b
         body(response);
         response.set_result(rv);
         return serialised(response);
+    } catch (const Refusal& refusal) {
+        return refused(responseName, refusal.rv);
     } catch (...) {
         return std::string();
     }

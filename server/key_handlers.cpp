@@ -17,6 +17,7 @@ std::string C_GenerateKey_Server(const std::string& request) {
         rv = ckpFunctions->C_GenerateKey(m.hsession(), mechanism.get(), tmpl.data(), tmpl.count(),
                                          &key);
         res.mutable_generatekeyres()->set_phkey(key);
+        mechanism.answerOutputs(res.mutable_generatekeyres());
     });
 }
 
@@ -62,6 +63,7 @@ std::string C_UnWrapKey_Server(const std::string& request) {
                                        wrapped.data(), m.ulwrappedkeylen(), tmpl.data(),
                                        tmpl.count(), &key);
         res.mutable_unwrapkeyres()->set_phkey(key);
+        mechanism.answerOutputs(res.mutable_unwrapkeyres());
     });
 }
 
@@ -76,6 +78,7 @@ std::string C_DeriveKey_Server(const std::string& request) {
         rv = ckpFunctions->C_DeriveKey(m.hsession(), mechanism.get(), m.hbasekey(), tmpl.data(),
                                        tmpl.count(), &key);
         res.mutable_derivekeyres()->set_phkey(key);
+        mechanism.answerOutputs(res.mutable_derivekeyres());
     });
 }
 

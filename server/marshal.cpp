@@ -3,6 +3,8 @@
 #include <algorithm>
 #include <cstddef>
 
+#include "by_value_layouts.h"
+
 #define LOG_TAG "Vokpkcs11f_Server"
 #include "vok_log.h"
 
@@ -81,52 +83,96 @@ void appendNumbers(NumberList* out, const CK_ULONG* values, uint64_t n) {
     for (uint64_t i = 0; i < n; ++i) out->Add(values[i]);
 }
 
-NativeTemplate::NativeTemplate(const AttributeList& sent, CK_ULONG count, TemplateRule rule)
-    : attributes_(count) {
+NativeTemplate::NativeTemplate(const AttributeList& sent, CK_ULONG count, TemplateRule rule,
+                               int depth, uint64_t* budget)
+    : attributes_(count), depth_(depth) {
     const int n = static_cast<int>(std::min<uint64_t>(count, sent.size()));
     auto hasValue = [&](const pkcs11::CK_ATTRIBUTE& a) {
         return a.has_pvalue() || rule.alwaysCopyValue;
     };
-    // All values together must fit a frame as well; checked before any is
-    // allocated.
-    uint64_t valueBytes = 0;
+    auto holdsTemplate = [&](const pkcs11::CK_ATTRIBUTE& a) {
+        return layout::isTemplateAttribute(a.type()) && a.has_pvaluetemplate();
+    };
+    // All values together must fit a frame as well, those of templates
+    // inside values included; checked before any is allocated.
+    uint64_t frame = kFrameLimit;
+    uint64_t& left = budget ? *budget : frame;
     for (int i = 0; i < n; ++i) {
         const pkcs11::CK_ATTRIBUTE& a = sent.Get(i);
-        if (!hasValue(a)) continue;
-        if (a.ulvaluelen() > kFrameLimit - valueBytes) throw std::bad_alloc();
-        valueBytes += a.ulvaluelen();
+        if (!hasValue(a) || holdsTemplate(a)) continue;
+        if (a.ulvaluelen() > left) throw std::bad_alloc();
+        left -= a.ulvaluelen();
     }
+    const bool log = depth == 0;  // templates inside values are not logged
     values_.resize(static_cast<size_t>(n));
+    templates_.resize(static_cast<size_t>(n));
     for (int i = 0; i < n; ++i) {
         const pkcs11::CK_ATTRIBUTE& a = sent.Get(i);
         CK_ATTRIBUTE& native = attributes_.data()[i];
-        VOK_LOGD("Inside for");
+        if (log) VOK_LOGD("Inside for");
         native.type = a.type();
-        VOK_LOGD("attr_type set");
-        if (hasValue(a)) {
-            if (a.has_pvalue()) VOK_LOGD("Inside if not NULL pdata");
-            native.pValue = values_[i].emplace(fromRequest(a.pvalue(), a.ulvaluelen())).data();
-        }
+        if (log) VOK_LOGD("attr_type set");
         native.ulValueLen = a.ulvaluelen();
-        if (rule.logValueLength) VOK_LOGD("attr_ulvaluelen set");
+        if (hasValue(a)) {
+            if (a.has_pvalue() && log) VOK_LOGD("Inside if not NULL pdata");
+            if (!nestTemplate(a, static_cast<size_t>(i), rule, left))
+                native.pValue = values_[i].emplace(fromRequest(a.pvalue(), a.ulvaluelen())).data();
+        }
+        if (rule.logValueLength && log) VOK_LOGD("attr_ulvaluelen set");
     }
 }
 
+bool NativeTemplate::nestTemplate(const pkcs11::CK_ATTRIBUTE& sent, size_t index,
+                                  TemplateRule rule, uint64_t& budget) {
+    if (!layout::isTemplateAttribute(sent.type())) return false;
+    CK_ATTRIBUTE& native = attributes_.data()[index];
+    if (sent.has_pvaluetemplate() && depth_ < layout::kMaxTemplateDepth) {
+        const AttributeList& entries = sent.pvaluetemplate().attribute();
+        templates_[index] = std::make_unique<NativeTemplate>(
+            entries, static_cast<CK_ULONG>(entries.size()), rule, depth_ + 1, &budget);
+        templates_[index]->sentLength_ = sent.ulvaluelen();
+        native.pValue = templates_[index]->data();
+        native.ulValueLen = templates_[index]->count() * sizeof(CK_ATTRIBUTE);
+        return true;
+    }
+    // The entries' bytes as they arrived may hold the client's pointers.
+    if (sent.ulvaluelen() != 0 && !sent.pvalue().empty()) {
+        VOK_LOGE("Attribute %llx: template without its entries, not passed",
+                 static_cast<unsigned long long>(sent.type()));
+        throw Refusal{CKR_ATTRIBUTE_VALUE_INVALID};
+    }
+    return false;
+}
+
 void NativeTemplate::echo(AttributeList* out, Echo rule) const {
+    const bool log = depth_ == 0;
     for (uint64_t i = 0; i < count(); ++i) {
         const CK_ATTRIBUTE& native = attributes_.data()[i];
         // The service's own record of the value buffer, not the pointer in the
         // template, which the module could have changed.
         const Bytes* value = i < values_.size() && values_[i] ? &*values_[i] : nullptr;
+        const NativeTemplate* nested = i < templates_.size() ? templates_[i].get() : nullptr;
         pkcs11::CK_ATTRIBUTE* a = out->Add();
         a->set_type(native.type);
-        if (!value) {
+        if (!value && !nested) {
             a->set_ulvaluelen(native.ulValueLen);  // a length query's answer
+            if (rule == Echo::kDropUnavailable && layout::isTemplateAttribute(native.type) &&
+                native.ulValueLen != CK_UNAVAILABLE_INFORMATION)
+                a->mutable_pvaluetemplate()->set_ulcount(native.ulValueLen / sizeof(CK_ATTRIBUTE));
             continue;
         }
-        VOK_LOGD("Inside response of if not null");
+        if (log) VOK_LOGD("Inside response of if not null");
         if (native.ulValueLen == CK_UNAVAILABLE_INFORMATION && rule != Echo::kVerbatim) {
-            if (rule == Echo::kDropUnavailableLogged) VOK_LOGD("Inside ulvaluelen is -1");
+            if (rule == Echo::kDropUnavailableLogged && log) VOK_LOGD("Inside ulvaluelen is -1");
+            continue;
+        }
+        if (nested) {
+            a->set_ulvaluelen(nested->sentLength_);
+            if (rule != Echo::kDropUnavailable) continue;
+            pkcs11::CK_TEMPLATE* entries = a->mutable_pvaluetemplate();
+            entries->set_ulcount(
+                std::min<uint64_t>(native.ulValueLen / sizeof(CK_ATTRIBUTE), nested->count()));
+            nested->echo(entries->mutable_attribute(), rule);
             continue;
         }
         a->set_pvalue(leading(*value, native.ulValueLen));

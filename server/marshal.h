@@ -34,6 +34,14 @@ constexpr uint64_t kFrameLimit = INT32_MAX;
 constexpr uint64_t kMaxElements = 1u << 20;
 
 using AttributeList = google::protobuf::RepeatedPtrField<pkcs11::CK_ATTRIBUTE>;
+
+// Thrown while a handler builds the module's arguments from a request the
+// module must not see (bytes that may hold a client's pointer): the answer
+// then carries the command's name and this code only, and the module is not
+// called.
+struct Refusal {
+    CK_RV rv;
+};
 using NumberList = google::protobuf::RepeatedField<google::protobuf::uint64>;
 
 struct FreeDeleter {
@@ -122,18 +130,33 @@ enum class Echo {
     kVerbatim,               // value and length as they stand, no -1 test
 };
 
+// A value that is itself a template (CKA_WRAP_TEMPLATE and its kin) is
+// rebuilt the same way, from its by-value form, `depth` levels down; its raw
+// bytes, which may hold client pointers, are refused with
+// CKR_ATTRIBUTE_VALUE_INVALID. `budget` bounds the value bytes of a template
+// and all templates inside it together (nullptr: a frame's worth).
 class NativeTemplate {
 public:
-    NativeTemplate(const AttributeList& sent, CK_ULONG count, TemplateRule rule);
+    NativeTemplate(const AttributeList& sent, CK_ULONG count, TemplateRule rule, int depth = 0,
+                   uint64_t* budget = nullptr);
     CK_ATTRIBUTE_PTR data() const { return attributes_.data(); }
     CK_ULONG count() const { return attributes_.count(); }
     // One message per native attribute, in order; values from the service's
-    // own buffers, never more than were allocated.
+    // own buffers, never more than were allocated. A template inside a value
+    // goes back by value (only for a query: the others echo its length as
+    // sent), never as the bytes of the service's entries.
     void echo(AttributeList* out, Echo rule) const;
 
 private:
+    // Builds one native attribute's value; false when it holds no template.
+    bool nestTemplate(const pkcs11::CK_ATTRIBUTE& sent, size_t index, TemplateRule rule,
+                      uint64_t& budget);
+
     Buffer<CK_ATTRIBUTE> attributes_;
-    std::vector<std::optional<Bytes>> values_;  // one per sent entry
+    std::vector<std::optional<Bytes>> values_;                // one per sent entry
+    std::vector<std::unique_ptr<NativeTemplate>> templates_;  // one per sent entry
+    int depth_;
+    CK_ULONG sentLength_ = 0;  // of the value this template is, in the client's units
 };
 
 // Info structures, member by member. Each text member is read as a C string
