@@ -50,7 +50,8 @@ void copyBackStructure(const Layout& l, void* s, const pkcs11::CK_STRUCTURE& ans
         const Member& m = l.members[i];
         const bool back = m.flow != Flow::kIn;
         if (isNumber(m)) {
-            if (back && number < answer.number_size()) layout::writeNumber(m, s, answer.number(number));
+            if (back && number < answer.number_size())
+                layout::writeNumber(m, s, answer.number(number));
             ++number;
             continue;
         }
@@ -114,8 +115,8 @@ bool copyBackTemplateValue(const pkcs11::CK_ATTRIBUTE& answer, CK_ATTRIBUTE& min
     }
     const CK_ULONG room = mine.ulValueLen / sizeof(CK_ATTRIBUTE);
     if (depth < layout::kMaxTemplateDepth)
-        copyBackTemplate(value.attribute(), value.ulcount(), static_cast<CK_ATTRIBUTE*>(mine.pValue),
-                         room, depth + 1);
+        copyBackTemplate(value.attribute(), value.ulcount(),
+                         static_cast<CK_ATTRIBUTE*>(mine.pValue), room, depth + 1);
     mine.ulValueLen = std::min<CK_ULONG>(value.ulcount(), room) * sizeof(CK_ATTRIBUTE);
     return true;
 }

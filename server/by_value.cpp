@@ -109,8 +109,8 @@ ParameterCopy::ParameterCopy(const Layout& l, const pkcs11::CK_STRUCTURE& sent,
                 memcpy(block_.data() + m.offset, entry.data().data(),
                        std::min<size_t>(m.length, entry.data().size()));
             } else if (pass == 1 && m.kind == Kind::kStructure && entry.has_structure()) {
-                structures_[at] = std::make_unique<ParameterCopy>(
-                    *m.pointee, entry.structure(), &l, block_.data(), budget);
+                structures_[at] = std::make_unique<ParameterCopy>(*m.pointee, entry.structure(), &l,
+                                                                  block_.data(), budget);
                 layout::writePointer(m, block_.data(), structures_[at]->data());
             } else if (pass == 2 && m.kind == Kind::kBuffer && entry.has_data()) {
                 const CK_ULONG length =
