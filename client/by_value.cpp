@@ -106,8 +106,13 @@ void putTemplateValue(pkcs11::CK_ATTRIBUTE* out, const CK_ATTRIBUTE& attribute, 
     }
 }
 
+bool holdsTemplate(const CK_ATTRIBUTE& mine) {
+    return mine.pValue && layout::isTemplateAttribute(mine.type);
+}
+
 bool copyBackTemplateValue(const pkcs11::CK_ATTRIBUTE& answer, CK_ATTRIBUTE& mine, int depth) {
-    if (!answer.has_pvaluetemplate() || !layout::isTemplateAttribute(answer.type())) return false;
+    if (!layout::isTemplateAttribute(mine.type) || answer.type() != mine.type) return false;
+    if (!answer.has_pvaluetemplate()) return mine.pValue != nullptr;
     const pkcs11::CK_TEMPLATE& value = answer.pvaluetemplate();
     if (!mine.pValue) {
         mine.ulValueLen = value.ulcount() * sizeof(CK_ATTRIBUTE);  // a length query

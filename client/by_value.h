@@ -26,10 +26,15 @@ void copyBackParameter(const CK_MECHANISM* mechanism, const pkcs11::CK_STRUCTURE
 // template, beside `out`'s raw value, whose pointers are zeroed.
 void putTemplateValue(pkcs11::CK_ATTRIBUTE* out, const CK_ATTRIBUTE& attribute, int depth);
 
-// Copy-back of an answer attribute that carries a template by value: the
-// entries into the caller's nested array, its length in this process's
-// units. False when the answer carries none (the plain rule applies).
+// Copy-back into a caller's attribute whose value is a template: the entries
+// of the answer's by-value form into the caller's nested array, and its
+// length in this process's units. Raw bytes never land in such an array (they
+// would replace the caller's pointers). False when the plain rule applies: the
+// attribute is no template, or a length query answered without entries.
 bool copyBackTemplateValue(const pkcs11::CK_ATTRIBUTE& answer, CK_ATTRIBUTE& mine, int depth);
+
+// A caller's value that is a template: only its by-value form writes into it.
+bool holdsTemplate(const CK_ATTRIBUTE& mine);
 
 }  // namespace client
 }  // namespace vok

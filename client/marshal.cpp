@@ -58,8 +58,8 @@ void copyBackTemplate(const AttributeList& answer, CK_ULONG statedCount, CK_ATTR
     for (CK_ULONG i = 0; i < n; ++i) {
         const pkcs11::CK_ATTRIBUTE& a = answer.Get(static_cast<int>(i));
         CK_ATTRIBUTE& mine = tmpl[i];
-        mine.type = a.type();
         if (copyBackTemplateValue(a, mine, depth)) continue;
+        mine.type = a.type();
         if (!mine.pValue) {
             mine.ulValueLen = a.ulvaluelen();  // length query
         } else if (a.has_pvalue()) {
@@ -76,6 +76,7 @@ void overwriteTemplate(const AttributeList& answer, CK_ATTRIBUTE* tmpl, CK_ULONG
     for (CK_ULONG i = 0; i < n; ++i) {
         const pkcs11::CK_ATTRIBUTE& a = answer.Get(static_cast<int>(i));
         CK_ATTRIBUTE& mine = tmpl[i];
+        if (holdsTemplate(mine)) continue;
         mine.type = a.type();
         if (mine.pValue)
             memcpy(mine.pValue, a.pvalue().data(),

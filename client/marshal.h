@@ -42,7 +42,8 @@ void copyBackTemplate(const AttributeList& answer, CK_ULONG statedCount, CK_ATTR
                       CK_ULONG callerCount, int depth = 0);
 
 // C_FindObjectsInit's copy-back: every returned attribute rewrites type, value
-// and length of the caller's entry, whether or not the answer carries a value.
+// and length of the caller's entry, whether or not the answer carries a value;
+// a caller's template value (by_value.h) is left alone.
 void overwriteTemplate(const AttributeList& answer, CK_ATTRIBUTE* tmpl, CK_ULONG callerCount);
 
 // List rule (C_GetSlotList, C_GetMechanismList).

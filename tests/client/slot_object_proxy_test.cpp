@@ -204,6 +204,27 @@ TEST_F(SlotObjectProxies, TemplateCopyBackStaysWithinTheCallersBuffersAndCount) 
     }
 }
 
+// A caller's nested template holds the caller's pointers: raw bytes from the
+// service, which could hold anything, never replace them.
+TEST_F(SlotObjectProxies, RawBytesNeverLandInACallersNestedTemplate) {
+    const std::pair<int, CK_RV (*)(CK_ATTRIBUTE*)> proxies[] = {
+        {7, [](CK_ATTRIBUTE* t) { return C_GetAttributeValue(kSession, kObject, t, 1); }},
+        {26, [](CK_ATTRIBUTE* t) { return C_SetAttributeValue(kSession, kObject, t, 1); }},
+        {8, [](CK_ATTRIBUTE* t) { return C_FindObjectsInit(kSession, t, 1); }}};
+    for (const auto& [answerField, call] : proxies) {
+        CK_BYTE value[4] = {1, 2, 3, 4};
+        CK_ATTRIBUTE nested[1] = {{CKA_LABEL, value, 4}};
+        const CK_ATTRIBUTE before = nested[0];
+        CK_ATTRIBUTE tmpl[1] = {{CKA_WRAP_TEMPLATE, nested, sizeof nested}};
+        const std::string raw(sizeof nested, 'A');
+        script("", CKR_OK, answerField,
+               {Field::attributes({{CKA_WRAP_TEMPLATE, raw, sizeof nested}}), 1});
+        ASSERT_EQ(CKR_OK, call(tmpl));
+        EXPECT_EQ(0, memcmp(&before, nested, sizeof before)) << answerField;
+        EXPECT_EQ(sizeof nested, tmpl[0].ulValueLen);
+    }
+}
+
 TEST_F(SlotObjectProxies, FindObjectsInitRewritesTheTemplateWhetherOrNotAValueCame) {
     char value[4 + 4];
     memcpy(value, "....####", 8);

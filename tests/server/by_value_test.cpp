@@ -87,12 +87,14 @@ struct Row {
     std::function<std::string(Buffers&)> build;  // the parameter's bytes
 };
 
-#define ROW(T, mechanism, ...)                                        \
-    Row {                                                             \
-#T, mechanism, []([[maybe_unused]] Buffers& b) {                    \
-            const T p{__VA_ARGS__};                                         \
-            return bytesOf(&p, sizeof p);                                   \
-        } \
+// One row per structure: its members, b(n) standing for a caller buffer of n
+// bytes.
+#define ROW(T, mechanism, ...)                                 \
+    Row {                                                      \
+        #T, mechanism, []([[maybe_unused]] Buffers& b) {       \
+            const T p{__VA_ARGS__};                            \
+            return bytesOf(&p, sizeof p);                      \
+        }                                                      \
     }
 
 const Row kRows[] = {
@@ -204,8 +206,8 @@ TEST_F(ByValue, NestedWrapTemplateInAndOut) {
 pkcs11::CK_MECHANISM* encryptInit(pkcs11::Operation& op, CK_MECHANISM_TYPE type, size_t length) {
     op.set_name("C_EncryptInit");
     pkcs11::CK_MECHANISM* m = op.mutable_encinit()->mutable_mechanism();
-    m->set_mechanism(type), m->set_pparameter(std::string(length, 'A')),
-        m->set_ulparameterlen(length);
+    m->set_mechanism(type), m->set_pparameter(std::string(length, 'A'));
+    m->set_ulparameterlen(length);
     return m;
 }
 
@@ -214,8 +216,8 @@ void gcm(pkcs11::Operation& op, size_t rawLength, int numbers = 4) {
     pkcs11::CK_STRUCTURE* v = encryptInit(op, CKM_AES_GCM, rawLength)->mutable_pparametervalue();
     for (uint64_t n : {12, 96, 20, 128})
         if (numbers-- > 0) v->add_number(n);
-    v->add_buffer()->set_data(std::string(12, 'i')),
-        v->add_buffer()->set_data(std::string(20, 'a'));
+    v->add_buffer()->set_data(std::string(12, 'i'));
+    v->add_buffer()->set_data(std::string(20, 'a'));
 }
 
 // A wrap template of bytes 0x41: alone to create an object, with one entry
@@ -252,14 +254,10 @@ const Frame kFrames[] = {
     {"GcmShortOfANumber", [](auto& op) { gcm(op, sizeof kGcm, 3); }, kParam, {}},
     {"VendorMechanism", [](auto& op) { encryptInit(op, CKM_VENDOR_DEFINED | 7, 16); }, kParam, {}},
     {"PointersWithoutForm", [](auto& op) { encryptInit(op, CKM_TLS_PRF, 48); }, kParam, {}},
-    {"PlainIv",
-     [](auto& op) { encryptInit(op, CKM_AES_CBC, 16); },
-     0,
+    {"PlainIv", [](auto& op) { encryptInit(op, CKM_AES_CBC, 16); }, 0,
      {"pMechanism 0 0 - 1 4226 0 16 " + hex(std::string(16, 'A'))}},
     {"NestedRaw", [](auto& op) { wrapTemplate(op, false); }, kValue, {}},
-    {"NestedByValue",
-     [](auto& op) { wrapTemplate(op, true); },
-     0,
+    {"NestedByValue", [](auto& op) { wrapTemplate(op, true); }, 0,
      {"nested 0 0 - 1 0 0 8 " + hex("12345678")}},
 };
 
