@@ -5,6 +5,7 @@
 #include <sys/resource.h>
 #include <sys/time.h>
 
+#include <algorithm>
 #include <array>
 #include <atomic>
 #include <cerrno>
@@ -310,12 +311,20 @@ TEST_F(ServerChannelTest, UsageTimeIsMinusOneWhileACommandIsWorkedOn) {
     ASSERT_TRUE(client.recvFrame(&h, &payload));
 
     // A window within one second, so that the request's and the response's
-    // values compare as times.
+    // values compare as times. The answer's time is recorded just after it is
+    // sent: its own log line says when.
+    auto answerTimesRecorded = [&] {
+        auto all = lines();
+        return std::count_if(all.begin(), all.end(), [](const std::string& l) {
+            return l.rfind("Last used Time Response", 0) == 0;
+        });
+    };
     timeval before, after;
     do {
+        const auto recorded = answerTimesRecorded();
         gettimeofday(&before, nullptr);
         expectVersionAnswered(client);
-        ASSERT_TRUE(waitForLine("process_client_command ret :0"));
+        ASSERT_TRUE(waitUntil([&] { return answerTimesRecorded() > recorded; }));
         gettimeofday(&after, nullptr);
     } while (before.tv_sec != after.tv_sec);
     const int32_t value = vokpkcs11_comm_server_getLastUsageTime();
