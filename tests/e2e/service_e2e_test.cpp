@@ -259,7 +259,8 @@ protected:
         EXPECT_EQ(caller->waitForLine("connected"), "connected") << caller->transcript();
         timeval now;
         gettimeofday(&now, nullptr);
-        if (now.tv_usec > 500000) std::this_thread::sleep_for(std::chrono::microseconds(1000000 - now.tv_usec));
+        if (now.tv_usec > 500000)
+            std::this_thread::sleep_for(std::chrono::microseconds(1000000 - now.tv_usec));
         caller->writeLine("go");
         std::string answered = caller->waitForLine("C_GetInfo");
         EXPECT_EQ(answered.find(kAllOnes), std::string::npos) << caller->transcript();
