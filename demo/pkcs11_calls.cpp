@@ -36,11 +36,11 @@ void check(const char* call, CK_RV rv) {
 }
 
 ProxyLibrary::ProxyLibrary(const std::string& library, const std::string& serverId) {
-    handle_ = dlopen(library.c_str(), RTLD_NOW | RTLD_LOCAL);
-    if (!handle_) throw std::runtime_error(std::string("cannot load ") + dlerror());
-    auto init = reinterpret_cast<int32_t (*)(const char*)>(dlsym(handle_, "vokpkcs11_client_init"));
-    deinit_ = reinterpret_cast<int (*)()>(dlsym(handle_, "vokpkcs11_client_deinit"));
-    auto getter = reinterpret_cast<CK_C_GetFunctionList>(dlsym(handle_, "C_GetFunctionList"));
+    void* handle = dlopen(library.c_str(), RTLD_NOW | RTLD_LOCAL);
+    if (!handle) throw std::runtime_error(std::string("cannot load ") + dlerror());
+    auto init = reinterpret_cast<int32_t (*)(const char*)>(dlsym(handle, "vokpkcs11_client_init"));
+    deinit_ = reinterpret_cast<int (*)()>(dlsym(handle, "vokpkcs11_client_deinit"));
+    auto getter = reinterpret_cast<CK_C_GetFunctionList>(dlsym(handle, "C_GetFunctionList"));
     if (!init || !deinit_ || !getter) throw std::runtime_error(library + ": missing entry points");
     int32_t status = kConnectFailed;
     for (int attempt = 0; attempt < 100 && status == kConnectFailed; ++attempt) {
@@ -52,9 +52,10 @@ ProxyLibrary::ProxyLibrary(const std::string& library, const std::string& server
     check("C_GetFunctionList", getter(&functions_));
 }
 
+// The library stays loaded: its function list lives as long as it does and is
+// never freed, so unloading it would only lose that list.
 ProxyLibrary::~ProxyLibrary() {
     if (deinit_) deinit_();
-    if (handle_) dlclose(handle_);
 }
 
 Session::Session(CK_FUNCTION_LIST* f) : f_(f) {

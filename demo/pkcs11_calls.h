@@ -44,7 +44,6 @@ public:
     CK_FUNCTION_LIST* functions() const { return functions_; }
 
 private:
-    void* handle_ = nullptr;
     int (*deinit_)() = nullptr;
     CK_FUNCTION_LIST* functions_ = nullptr;
 };

@@ -1,15 +1,17 @@
-// The real path: this process is the application, calling the exported C_
-// proxies; the Java service host serves SoftHSM2 through the module bridge
-// across the socket. What the token produces is checked with OpenSSL, and the
-// information structures against SoftHSM2 called directly.
+// The real path, run by scripts/demo as its client: this process is the
+// application calling the exported C_ proxies, and the Java service host
+// serves SoftHSM2 through the module bridge across the socket. What the token
+// produces is checked with OpenSSL, and the information structures against
+// SoftHSM2 called directly.
+//
+//   softhsm_e2e_tests [gtest flags] <proxy library> <server id> <user PIN> <file>
 
 #include <dlfcn.h>
-#include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <unistd.h>
 
 #include <algorithm>
-#include <functional>
+#include <iostream>
+#include <map>
 #include <memory>
 #include <string>
 #include <vector>
@@ -18,182 +20,122 @@
 #include "member_table.h"
 #include "openssl_checks.h"
 #include "pkcs11_calls.h"
-#include "service_host.h"
-#include "softhsm_token.h"
 
 namespace {
 
 using namespace vok::demo;
 using vok::test::differingMembers;
-using vok::test::SoftHsmToken;
 
-std::string directoryOf(const std::string& path) { return path.substr(0, path.rfind('/')); }
+// The application's one channel and logged-in session, for every case.
+std::unique_ptr<ProxyLibrary> proxy;
+std::unique_ptr<Session> session;
 
 Bytes bytes(const std::string& text) { return Bytes(text.begin(), text.end()); }
 
-class SoftHsmThroughProxy : public ::testing::Test {
-protected:
-    void SetUp() override {
-        ASSERT_TRUE(token_.ready());
-        const auto* test = ::testing::UnitTest::GetInstance()->current_test_info();
-        const std::string serverId =
-            "Xvok-softhsm-" + std::to_string(getpid()) + "-" + test->name();
-        host_.reset(new vok::test::ServiceHostProcess(
-            VOK_TEST_JAVA, VOK_TEST_JAR, directoryOf(VOK_TEST_WRAPPER), serverId, VOK_TEST_BRIDGE));
-        ASSERT_TRUE(host_->serving()) << host_->output();
-        proxy_.reset(new ProxyLibrary(VOK_TEST_WRAPPER, serverId));
-        f_ = proxy_->functions();
-        check("C_Initialize", f_->C_Initialize(nullptr));
-        session_.reset(new Session(f_));
-        session_->login(SoftHsmToken::kUserPin);
-    }
-    void TearDown() override {
-        session_.reset();
-        if (f_) f_->C_Finalize(nullptr);
-        proxy_.reset();
-        host_.reset();
-    }
-
-    SoftHsmToken token_;
-    std::unique_ptr<vok::test::ServiceHostProcess> host_;
-    std::unique_ptr<ProxyLibrary> proxy_;
-    CK_FUNCTION_LIST* f_ = nullptr;
-    std::unique_ptr<Session> session_;
-};
-
 // SoftHSM2 2.6 signs with plain CKM_ECDSA only: the token signs the SHA-256
 // digest, which OpenSSL's ECDSA-SHA256 verification computes itself.
-TEST_F(SoftHsmThroughProxy, EcdsaP256SignatureVerifiesWithOpenSsl) {
+TEST(SoftHsmThroughProxy, EcdsaP256SignatureVerifiesWithOpenSsl) {
     CK_OBJECT_HANDLE publicKey, privateKey;
-    session_->generateEcP256(&publicKey, &privateKey);
+    session->generateEcP256(&publicKey, &privateKey);
     const Bytes data = bytes("ECDSA over SHA-256, made on the token");
-    const Bytes signature = session_->sign({CKM_ECDSA, nullptr, 0}, privateKey, sha256(data));
-    const Bytes point = session_->attribute(publicKey, CKA_EC_POINT);
-    EXPECT_TRUE(verifyEcdsaP256Sha256(point, data, signature)) << hex(point) << "\n"
-                                                               << hex(signature);
-    Bytes other = data;
-    other[0] ^= 1;
-    EXPECT_FALSE(verifyEcdsaP256Sha256(point, other, signature));
+    const Bytes signature = session->sign({CKM_ECDSA, nullptr, 0}, privateKey, sha256(data));
+    const Bytes point = session->attribute(publicKey, CKA_EC_POINT);
+    EXPECT_TRUE(verifyEcdsaP256Sha256(point, data, signature)) << hex(point);
+    EXPECT_FALSE(verifyEcdsaP256Sha256(point, bytes("another message"), signature));
 }
 
-TEST_F(SoftHsmThroughProxy, RsaPkcs1SignatureVerifiesWithOpenSsl) {
+TEST(SoftHsmThroughProxy, RsaPkcs1SignatureVerifiesWithOpenSsl) {
     CK_OBJECT_HANDLE publicKey, privateKey;
-    session_->generateRsa2048(&publicKey, &privateKey);
+    session->generateRsa2048(&publicKey, &privateKey);
     const Bytes data = bytes("RSA PKCS#1 v1.5 over SHA-256, made on the token");
-    const Bytes signature = session_->sign({CKM_SHA256_RSA_PKCS, nullptr, 0}, privateKey, data);
-    const Bytes modulus = session_->attribute(publicKey, CKA_MODULUS);
-    const Bytes exponent = session_->attribute(publicKey, CKA_PUBLIC_EXPONENT);
+    const Bytes signature = session->sign({CKM_SHA256_RSA_PKCS, nullptr, 0}, privateKey, data);
+    const Bytes modulus = session->attribute(publicKey, CKA_MODULUS);
     EXPECT_EQ(modulus.size(), 256u);
-    EXPECT_EQ(signature.size(), 256u);
-    EXPECT_TRUE(verifyRsaPkcs1Sha256(modulus, exponent, data, signature));
+    EXPECT_TRUE(verifyRsaPkcs1Sha256(modulus, session->attribute(publicKey, CKA_PUBLIC_EXPONENT),
+                                     data, signature));
 }
 
-TEST_F(SoftHsmThroughProxy, AesCbcPadCiphertextDecryptsWithOpenSsl) {
-    const CK_OBJECT_HANDLE key = session_->generateAes256(true);
+TEST(SoftHsmThroughProxy, AesCbcPadCiphertextDecryptsWithOpenSsl) {
+    const CK_OBJECT_HANDLE key = session->generateAes256(true);
     Bytes iv = {0, 1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 13, 14, 15};
     const Bytes plain = bytes("forty-one bytes of plain text to encrypt.");
-    const Bytes cipher = session_->encrypt({CKM_AES_CBC_PAD, iv.data(), iv.size()}, key, plain);
+    const Bytes cipher = session->encrypt({CKM_AES_CBC_PAD, iv.data(), iv.size()}, key, plain);
     EXPECT_EQ(cipher.size(), 48u);
     Bytes decrypted;
-    ASSERT_TRUE(decryptAes256CbcPad(session_->attribute(key, CKA_VALUE), iv, cipher, &decrypted));
+    ASSERT_TRUE(decryptAes256CbcPad(session->attribute(key, CKA_VALUE), iv, cipher, &decrypted));
     EXPECT_EQ(decrypted, plain);
 }
 
-TEST_F(SoftHsmThroughProxy, Sha256DigestsMatchOpenSsl) {
+TEST(SoftHsmThroughProxy, Sha256DigestsMatchOpenSsl) {
     for (size_t size : {size_t(0), size_t(1), size_t(4096), size_t(1) << 20}) {
         Bytes data(size);
         for (size_t i = 0; i < size; ++i) data[i] = static_cast<unsigned char>(i * 31 + 7);
-        EXPECT_EQ(hex(session_->sha256(data)), hex(sha256(data))) << size << " bytes";
+        EXPECT_EQ(hex(session->sha256(data)), hex(sha256(data))) << size << " bytes";
     }
 }
 
-// The information structures cross two conversions: SoftHSM2's standard
-// layout to the packed one in the bridge, and the packed structure to the
-// message and back between service and proxy.
-class InformationThroughProxy : public SoftHsmThroughProxy {
-protected:
-    void SetUp() override {
-        SoftHsmThroughProxy::SetUp();
-        module_ = dlopen(SoftHsmToken::kModule, RTLD_NOW | RTLD_LOCAL);
-        ASSERT_NE(module_, nullptr) << dlerror();
-        auto getter =
-            reinterpret_cast<host::CK_C_GetFunctionList>(dlsym(module_, "C_GetFunctionList"));
-        ASSERT_TRUE(getter && getter(&direct_) == CKR_OK);
-        ASSERT_EQ(direct_->C_Initialize(nullptr), CKR_OK);
-        // The same sessions on both sides, so that the token's counters agree.
-        ASSERT_EQ(direct_->C_OpenSession(session_->slot(), CKF_SERIAL_SESSION | CKF_RW_SESSION,
-                                         nullptr, nullptr, &directSession_),
-                  CKR_OK);
-    }
-    void TearDown() override {
-        if (direct_) direct_->C_Finalize(nullptr);
-        if (module_) dlclose(module_);
-        SoftHsmThroughProxy::TearDown();
-    }
-
-    void* module_ = nullptr;
-    host::ck_function_list* direct_ = nullptr;
-    CK_SESSION_HANDLE directSession_ = 0;
-};
-
-// Every member arrives as SoftHSM2 gave it, but for the texts the system's
-// own text rules do not carry: the service sends a text member as a C string
-// that runs on into the following members up to the first zero byte, and the
-// proxies of C_GetInfo and C_GetSlotInfo copy only a text that fits its member,
-// leaving the caller's bytes otherwise (C_GetTokenInfo cuts every text to its
-// member). With SoftHSM2's blank-padded texts:
-// - CK_INFO.libraryDescription runs on into libraryVersion (2.6): 34 bytes;
-// - CK_SLOT_INFO.slotDescription runs on through manufacturerID into flags
-//   (CKF_TOKEN_PRESENT): 97 bytes; manufacturerID into flags: 33 bytes.
-// CK_INFO.manufacturerID stops at flags, which are 0, and arrives whole.
-TEST_F(InformationThroughProxy, StructuresMatchTheModuleButWhereTextRulesKeepTheCallersBytes) {
-    constexpr unsigned char kCallers = '#';
-    const CK_SLOT_ID slot = session_->slot();
-    struct Row {
-        const char* call;
-        const std::vector<vok::test::Member>& members;
-        std::vector<std::string> callersBytesKept;
-        std::function<void(void* proxied, void* direct)> fill;
-    };
-    const std::vector<Row> rows = {
-        {"C_GetInfo",
-         vok::test::kInfoMembers,
-         {"CK_INFO.libraryDescription"},
-         [&](void* p, void* d) {
-             ASSERT_EQ(f_->C_GetInfo(static_cast<CK_INFO*>(p)), CKR_OK);
-             ASSERT_EQ(direct_->C_GetInfo(static_cast<host::ck_info*>(d)), CKR_OK);
-         }},
-        {"C_GetSlotInfo",
-         vok::test::kSlotInfoMembers,
-         {"CK_SLOT_INFO.slotDescription", "CK_SLOT_INFO.manufacturerID"},
-         [&](void* p, void* d) {
-             ASSERT_EQ(f_->C_GetSlotInfo(slot, static_cast<CK_SLOT_INFO*>(p)), CKR_OK);
-             ASSERT_EQ(direct_->C_GetSlotInfo(slot, static_cast<host::ck_slot_info*>(d)), CKR_OK);
-         }},
-        {"C_GetTokenInfo",
-         vok::test::kTokenInfoMembers,
-         {},
-         [&](void* p, void* d) {
-             ASSERT_EQ(f_->C_GetTokenInfo(slot, static_cast<CK_TOKEN_INFO*>(p)), CKR_OK);
-             ASSERT_EQ(direct_->C_GetTokenInfo(slot, static_cast<host::ck_token_info*>(d)), CKR_OK);
-         }},
-    };
-    for (const Row& row : rows) {
-        SCOPED_TRACE(row.call);
-        Bytes proxied(sizeof(CK_TOKEN_INFO), kCallers);
-        Bytes direct(sizeof(host::ck_token_info), 0);
-        row.fill(proxied.data(), direct.data());
-        EXPECT_EQ(differingMembers(row.members, proxied.data(), direct.data()),
-                  row.callersBytesKept);
-        for (const vok::test::Member& m : row.members) {
-            const auto& kept = row.callersBytesKept;
+// Two conversions (standard to packed in the bridge; packed to message and back
+// between service and proxy) keep every member, but for the texts the system's
+// run-on rule does not carry: the service sends a text member as a C string
+// running on up to the next zero byte, and the C_GetInfo and C_GetSlotInfo
+// proxies keep the caller's bytes for a text longer than its member. SoftHSM2's
+// library description runs on into libraryVersion (34 bytes), its slot
+// description and slot manufacturer into the flags (97 and 33 bytes).
+TEST(SoftHsmThroughProxy, InformationMatchesTheModuleButWhereTextRulesKeepTheCallersBytes) {
+    void* module = dlopen(SOFTHSM_MODULE, RTLD_NOW | RTLD_LOCAL);
+    ASSERT_NE(module, nullptr) << dlerror();
+    auto getter = reinterpret_cast<host::CK_C_GetFunctionList>(dlsym(module, "C_GetFunctionList"));
+    host::ck_function_list* direct = nullptr;
+    ASSERT_TRUE(getter && getter(&direct) == CKR_OK && direct->C_Initialize(nullptr) == CKR_OK);
+    // As many sessions as the service has open, so that the token's counters agree.
+    CK_SESSION_HANDLE mirror;
+    const CK_SLOT_ID slot = session->slot();
+    ASSERT_EQ(
+        direct->C_OpenSession(slot, CKF_SERIAL_SESSION | CKF_RW_SESSION, nullptr, nullptr, &mirror),
+        CKR_OK);
+    const std::map<std::string, std::vector<std::string>> callersBytesKept = {
+        {"C_GetInfo", {"CK_INFO.libraryDescription"}},
+        {"C_GetSlotInfo", {"CK_SLOT_INFO.slotDescription", "CK_SLOT_INFO.manufacturerID"}},
+        {"C_GetTokenInfo", {}}};
+    for (const vok::test::InfoCall& call : vok::test::kInfoCalls) {
+        const std::vector<std::string>& kept = callersBytesKept.at(call.name);
+        Bytes proxied(call.packedSize, '#'), fromModule(sizeof(host::ck_token_info), 0);
+        EXPECT_EQ(call.fill(proxy->functions(), direct, slot, proxied.data(), fromModule.data()),
+                  CKR_OK)
+            << call.name;
+        EXPECT_EQ(differingMembers(call.members, proxied.data(), fromModule.data()), kept)
+            << call.name;
+        for (const vok::test::Member& m : call.members) {
             if (std::find(kept.begin(), kept.end(), m.name) == kept.end()) continue;
             const auto at = proxied.begin() + static_cast<long>(m.packedOffset);
-            EXPECT_EQ(Bytes(at, at + static_cast<long>(m.packedSize)),
-                      Bytes(m.packedSize, kCallers))
+            EXPECT_EQ(Bytes(at, at + static_cast<long>(m.packedSize)), Bytes(m.packedSize, '#'))
                 << m.name;
         }
     }
+    direct->C_Finalize(nullptr);
+    dlclose(module);
 }
 
 }  // namespace
+
+int main(int argc, char** argv) {
+    ::testing::InitGoogleTest(&argc, argv);
+    if (argc != 5) {
+        std::cerr << "usage: " << argv[0] << " <proxy library> <server id> <user PIN> <file>\n";
+        return 2;
+    }
+    try {
+        proxy.reset(new ProxyLibrary(argv[1], argv[2]));
+        check("C_Initialize", proxy->functions()->C_Initialize(nullptr));
+        session.reset(new Session(proxy->functions()));
+        session->login(argv[3]);
+    } catch (const std::exception& e) {
+        std::cerr << "cannot use the token through the proxy: " << e.what() << "\n";
+        return 1;
+    }
+    const int status = RUN_ALL_TESTS();
+    session.reset();
+    proxy->functions()->C_Finalize(nullptr);
+    proxy.reset();
+    return status;
+}
