@@ -1,7 +1,7 @@
 #ifndef VOK_TEST_MEMBER_TABLE_H
 #define VOK_TEST_MEMBER_TABLE_H
 
-// Where every member of the information structures lies on each side, written
+// Where every member of the converted structures lies on each side, written
 // out member by member from the two headers (not from the bridge's own
 // description), so that a member the bridge misplaces or swaps shows up.
 
@@ -21,60 +21,70 @@ struct Member {
     size_t standardOffset, standardSize;
 };
 
+// clang-format off
 #define VOK_MEMBER(P, p, H, h) \
     Member { #P "." #p, offsetof(P, p), sizeof(P::p), offsetof(H, h), sizeof(H::h) }
+#define VOK_INFO(p, h) VOK_MEMBER(CK_INFO, p, host::ck_info, h)
+#define VOK_SLOT(p, h) VOK_MEMBER(CK_SLOT_INFO, p, host::ck_slot_info, h)
+#define VOK_TOKEN(p, h) VOK_MEMBER(CK_TOKEN_INFO, p, host::ck_token_info, h)
 
 inline const std::vector<Member> kInfoMembers = {
-    VOK_MEMBER(CK_INFO, cryptokiVersion, host::ck_info, cryptoki_version),
-    VOK_MEMBER(CK_INFO, manufacturerID, host::ck_info, manufacturer_id),
-    VOK_MEMBER(CK_INFO, flags, host::ck_info, flags),
-    VOK_MEMBER(CK_INFO, libraryDescription, host::ck_info, library_description),
-    VOK_MEMBER(CK_INFO, libraryVersion, host::ck_info, library_version),
-};
+    VOK_INFO(cryptokiVersion, cryptoki_version), VOK_INFO(manufacturerID, manufacturer_id),
+    VOK_INFO(flags, flags), VOK_INFO(libraryDescription, library_description),
+    VOK_INFO(libraryVersion, library_version)};
 
 inline const std::vector<Member> kSlotInfoMembers = {
-    VOK_MEMBER(CK_SLOT_INFO, slotDescription, host::ck_slot_info, slot_description),
-    VOK_MEMBER(CK_SLOT_INFO, manufacturerID, host::ck_slot_info, manufacturer_id),
-    VOK_MEMBER(CK_SLOT_INFO, flags, host::ck_slot_info, flags),
-    VOK_MEMBER(CK_SLOT_INFO, hardwareVersion, host::ck_slot_info, hardware_version),
-    VOK_MEMBER(CK_SLOT_INFO, firmwareVersion, host::ck_slot_info, firmware_version),
-};
+    VOK_SLOT(slotDescription, slot_description), VOK_SLOT(manufacturerID, manufacturer_id),
+    VOK_SLOT(flags, flags), VOK_SLOT(hardwareVersion, hardware_version),
+    VOK_SLOT(firmwareVersion, firmware_version)};
 
 inline const std::vector<Member> kTokenInfoMembers = {
-    VOK_MEMBER(CK_TOKEN_INFO, label, host::ck_token_info, label),
-    VOK_MEMBER(CK_TOKEN_INFO, manufacturerID, host::ck_token_info, manufacturer_id),
-    VOK_MEMBER(CK_TOKEN_INFO, model, host::ck_token_info, model),
-    VOK_MEMBER(CK_TOKEN_INFO, serialNumber, host::ck_token_info, serial_number),
-    VOK_MEMBER(CK_TOKEN_INFO, flags, host::ck_token_info, flags),
-    VOK_MEMBER(CK_TOKEN_INFO, ulMaxSessionCount, host::ck_token_info, max_session_count),
-    VOK_MEMBER(CK_TOKEN_INFO, ulSessionCount, host::ck_token_info, session_count),
-    VOK_MEMBER(CK_TOKEN_INFO, ulMaxRwSessionCount, host::ck_token_info, max_rw_session_count),
-    VOK_MEMBER(CK_TOKEN_INFO, ulRwSessionCount, host::ck_token_info, rw_session_count),
-    VOK_MEMBER(CK_TOKEN_INFO, ulMaxPinLen, host::ck_token_info, max_pin_len),
-    VOK_MEMBER(CK_TOKEN_INFO, ulMinPinLen, host::ck_token_info, min_pin_len),
-    VOK_MEMBER(CK_TOKEN_INFO, ulTotalPublicMemory, host::ck_token_info, total_public_memory),
-    VOK_MEMBER(CK_TOKEN_INFO, ulFreePublicMemory, host::ck_token_info, free_public_memory),
-    VOK_MEMBER(CK_TOKEN_INFO, ulTotalPrivateMemory, host::ck_token_info, total_private_memory),
-    VOK_MEMBER(CK_TOKEN_INFO, ulFreePrivateMemory, host::ck_token_info, free_private_memory),
-    VOK_MEMBER(CK_TOKEN_INFO, hardwareVersion, host::ck_token_info, hardware_version),
-    VOK_MEMBER(CK_TOKEN_INFO, firmwareVersion, host::ck_token_info, firmware_version),
-    VOK_MEMBER(CK_TOKEN_INFO, utcTime, host::ck_token_info, utc_time),
-};
+    VOK_TOKEN(label, label), VOK_TOKEN(manufacturerID, manufacturer_id), VOK_TOKEN(model, model),
+    VOK_TOKEN(serialNumber, serial_number), VOK_TOKEN(flags, flags),
+    VOK_TOKEN(ulMaxSessionCount, max_session_count), VOK_TOKEN(ulSessionCount, session_count),
+    VOK_TOKEN(ulMaxRwSessionCount, max_rw_session_count),
+    VOK_TOKEN(ulRwSessionCount, rw_session_count), VOK_TOKEN(ulMaxPinLen, max_pin_len),
+    VOK_TOKEN(ulMinPinLen, min_pin_len), VOK_TOKEN(ulTotalPublicMemory, total_public_memory),
+    VOK_TOKEN(ulFreePublicMemory, free_public_memory),
+    VOK_TOKEN(ulTotalPrivateMemory, total_private_memory),
+    VOK_TOKEN(ulFreePrivateMemory, free_private_memory),
+    VOK_TOKEN(hardwareVersion, hardware_version), VOK_TOKEN(firmwareVersion, firmware_version),
+    VOK_TOKEN(utcTime, utc_time)};
 
-inline const std::vector<Member> kSessionInfoMembers = {
-    VOK_MEMBER(CK_SESSION_INFO, slotID, host::ck_session_info, slot_id),
-    VOK_MEMBER(CK_SESSION_INFO, state, host::ck_session_info, state),
-    VOK_MEMBER(CK_SESSION_INFO, flags, host::ck_session_info, flags),
-    VOK_MEMBER(CK_SESSION_INFO, ulDeviceError, host::ck_session_info, device_error),
-};
-
-inline const std::vector<Member> kMechanismInfoMembers = {
-    VOK_MEMBER(CK_MECHANISM_INFO, ulMinKeySize, host::ck_mechanism_info, min_key_size),
-    VOK_MEMBER(CK_MECHANISM_INFO, ulMaxKeySize, host::ck_mechanism_info, max_key_size),
-    VOK_MEMBER(CK_MECHANISM_INFO, flags, host::ck_mechanism_info, flags),
-};
-
+// clang-format on
+#undef VOK_INFO
+#undef VOK_SLOT
+#undef VOK_TOKEN
 #undef VOK_MEMBER
+
+// The calls that fill the converted structures, one row each: the packed
+// structure through `packed` (the bridge, or the proxy), the standard one
+// through `standard` (SoftHSM2 called directly).
+struct InfoCall {
+    const char* name;
+    const std::vector<Member>& members;
+    size_t packedSize;
+    CK_RV (*fill)(CK_FUNCTION_LIST* packed, host::ck_function_list* standard, CK_SLOT_ID slot,
+                  void* packedInfo, void* standardInfo);
+};
+
+inline const std::vector<InfoCall> kInfoCalls = {
+    {"C_GetInfo", kInfoMembers, sizeof(CK_INFO),
+     [](CK_FUNCTION_LIST* p, host::ck_function_list* s, CK_SLOT_ID, void* pi, void* si) {
+         return p->C_GetInfo(static_cast<CK_INFO*>(pi)) |
+                s->C_GetInfo(static_cast<host::ck_info*>(si));
+     }},
+    {"C_GetSlotInfo", kSlotInfoMembers, sizeof(CK_SLOT_INFO),
+     [](CK_FUNCTION_LIST* p, host::ck_function_list* s, CK_SLOT_ID slot, void* pi, void* si) {
+         return p->C_GetSlotInfo(slot, static_cast<CK_SLOT_INFO*>(pi)) |
+                s->C_GetSlotInfo(slot, static_cast<host::ck_slot_info*>(si));
+     }},
+    {"C_GetTokenInfo", kTokenInfoMembers, sizeof(CK_TOKEN_INFO),
+     [](CK_FUNCTION_LIST* p, host::ck_function_list* s, CK_SLOT_ID slot, void* pi, void* si) {
+         return p->C_GetTokenInfo(slot, static_cast<CK_TOKEN_INFO*>(pi)) |
+                s->C_GetTokenInfo(slot, static_cast<host::ck_token_info*>(si));
+     }},
+};
 
 // The names of the members whose bytes differ between `packed` and `standard`.
 inline std::vector<std::string> differingMembers(const std::vector<Member>& members,
