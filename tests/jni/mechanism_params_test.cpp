@@ -305,9 +305,8 @@ TEST_F(MechanismParams, KeyMaterialThatCannotBeAllocatedLeavesTheRest) {
     jMechanismParameterToCKMechanismParameter(env_, jParam, &native, &length);
     EXPECT_EQ(takePendingException(env_).className, "java.lang.OutOfMemoryError");
     ASSERT_NE(native, nullptr);
-    auto* params = static_cast<CK_SSL3_KEY_MAT_PARAMS*>(native);
-    EXPECT_EQ(params->ulKeySizeInBits, 128u);
-    EXPECT_EQ(params->pReturnedKeyMaterial, nullptr);
+    EXPECT_EQ(static_cast<CK_SSL3_KEY_MAT_PARAMS*>(native)->ulKeySizeInBits, 128u);
+    EXPECT_EQ(pointerAt(native, offsetof(CK_SSL3_KEY_MAT_PARAMS, pReturnedKeyMaterial)), nullptr);
     CK_MECHANISM ck{CKM_SSL3_KEY_AND_MAC_DERIVE, native, length};
     freeCKMechanismParameter(&ck);
 
