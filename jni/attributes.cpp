@@ -43,9 +43,18 @@ enum ValueClass {
 };
 
 const char* const kValueClassNames[kValueClassCount] = {
-    "java/lang/Long",      "java/lang/Boolean", "[B",  "[C",  "java/lang/Byte",
-    "com/vok/smartcard/pkcs11/CK_DATE",         "java/lang/Character",
-    "java/lang/Integer",   "[Z",                "[I",  "[J",  "java/lang/String",
+    "java/lang/Long",
+    "java/lang/Boolean",
+    "[B",
+    "[C",
+    "java/lang/Byte",
+    "com/vok/smartcard/pkcs11/CK_DATE",
+    "java/lang/Character",
+    "java/lang/Integer",
+    "[Z",
+    "[I",
+    "[J",
+    "java/lang/String",
 };
 
 const char* const kAttributeArrayClass = "[Lcom/vok/smartcard/pkcs11/CK_ATTRIBUTE;";
@@ -73,10 +82,10 @@ void throwUnconvertible(JNIEnv* env, jobject object) {
     jclass bufferClass = env->FindClass("java/lang/StringBuffer");
     if (bufferClass == nullptr) return;
     jmethodID constructor = env->GetMethodID(bufferClass, "<init>", "(Ljava/lang/String;)V");
-    jmethodID append =
-        constructor != nullptr
-            ? env->GetMethodID(bufferClass, "append", "(Ljava/lang/String;)Ljava/lang/StringBuffer;")
-            : nullptr;
+    jmethodID append = constructor != nullptr
+                           ? env->GetMethodID(bufferClass, "append",
+                                              "(Ljava/lang/String;)Ljava/lang/StringBuffer;")
+                           : nullptr;
     if (append == nullptr) return;
     jstring prefix =
         env->NewStringUTF("Java object of this class cannot be converted to native PKCS#11 type: ");
@@ -87,8 +96,8 @@ void throwUnconvertible(JNIEnv* env, jobject object) {
     if (env->ExceptionCheck()) return;
     // The exception takes a String: the buffer's text is handed over, not
     // the buffer itself.
-    auto message = static_cast<jstring>(
-        callObjectMethod(env, buffer, "toString", "()Ljava/lang/String;"));
+    auto message =
+        static_cast<jstring>(callObjectMethod(env, buffer, "toString", "()Ljava/lang/String;"));
     if (env->ExceptionCheck()) return;
     throwPKCS11RuntimeException(env, message);
 }
@@ -327,8 +336,8 @@ CK_ATTRIBUTE jAttributeToCKAttribute(JNIEnv* env, jobject jAttribute) {
     return attribute;
 }
 
-int jAttributeArrayToCKAttributeArray(JNIEnv* env, jobjectArray jArray,
-                                      CK_ATTRIBUTE_PTR* ckpArray, CK_ULONG_PTR ckpCount) {
+int jAttributeArrayToCKAttributeArray(JNIEnv* env, jobjectArray jArray, CK_ATTRIBUTE_PTR* ckpArray,
+                                      CK_ULONG_PTR ckpCount) {
     VOK_LOGD("%s", "jAttributeArrayToCKAttributeArray");
     VOK_LOGD("\nDEBUG: jAttributeArrayToCKAttributeArray");
     *ckpArray = nullptr;
@@ -467,8 +476,8 @@ jobjectArray ckAttributeArrayToJAttributeArray(JNIEnv* env, const CK_ATTRIBUTE* 
     if (!fitsJavaArray(env, count)) return nullptr;
     LocalRef<jclass> cls(env, findBindingClass(env, "CK_ATTRIBUTE"));
     if (cls.get() == nullptr) return nullptr;
-    LocalRef<jobjectArray> array(env,
-                                 env->NewObjectArray(static_cast<jsize>(count), cls.get(), nullptr));
+    LocalRef<jobjectArray> array(
+        env, env->NewObjectArray(static_cast<jsize>(count), cls.get(), nullptr));
     if (array.get() == nullptr) return nullptr;
     for (CK_ULONG i = 0; i < count; ++i) {
         LocalRef<jobject> element(env, ckAttributePtrToJAttribute(env, &ckpArray[i]));

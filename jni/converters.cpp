@@ -33,8 +33,7 @@ void clearOutputs(void* pointerOut, CK_ULONG_PTR lengthOut) {
 // The shape every array converter shares: the Java elements are copied into a
 // temporary buffer with one region copy (first allocation), then widened or
 // narrowed into the native buffer (second allocation).
-template <typename JArray, typename JElement, typename CKElement, typename Read,
-          typename Convert>
+template <typename JArray, typename JElement, typename CKElement, typename Read, typename Convert>
 int convertArray(JNIEnv* env, JArray jArray, CKElement** ckpArray, CK_ULONG_PTR ckpLength,
                  Read read, Convert convert) {
     *ckpArray = nullptr;
@@ -242,8 +241,8 @@ CK_ULONG_PTR jIntegerObjectToCKULongPtr(JNIEnv* env, jobject jInteger) {
 
 CK_ULONG_PTR jLongObjectToCKULongPtr(JNIEnv* env, jobject jLong) {
     jlong value = 0;
-    if (!callValueMethod(env, jLong, "java/lang/Long", "longValue", "()J",
-                         &JNIEnv::CallLongMethod, &value))
+    if (!callValueMethod(env, jLong, "java/lang/Long", "longValue", "()J", &JNIEnv::CallLongMethod,
+                         &value))
         return nullptr;
     return newValue<CK_ULONG>(env, static_cast<CK_ULONG>(value));
 }
@@ -311,15 +310,15 @@ jcharArray ckCharArrayToJCharArray(JNIEnv* env, const CK_CHAR* ckpArray, CK_ULON
         throwOutOfMemoryError(env);
         return nullptr;
     }
-    for (jsize i = 0; i < length && ckpArray != nullptr; ++i) temp[i] = static_cast<jchar>(ckpArray[i]);
+    for (jsize i = 0; i < length && ckpArray != nullptr; ++i)
+        temp[i] = static_cast<jchar>(ckpArray[i]);
     jcharArray array = env->NewCharArray(length);
     if (array != nullptr) env->SetCharArrayRegion(array, 0, length, temp);
     gConverterFree(temp);
     return array;
 }
 
-jcharArray ckUTF8CharArrayToJCharArray(JNIEnv* env, const CK_UTF8CHAR* ckpArray,
-                                       CK_ULONG ckLength)
+jcharArray ckUTF8CharArrayToJCharArray(JNIEnv* env, const CK_UTF8CHAR* ckpArray, CK_ULONG ckLength)
     __attribute__((alias("ckCharArrayToJCharArray")));
 
 jlongArray ckULongArrayToJLongArray(JNIEnv* env, const CK_ULONG* ckpArray, CK_ULONG ckCount) {
@@ -360,7 +359,7 @@ jobject ckDatePtrToJDateObject(JNIEnv* env, const CK_DATE* ckpDate) {
         .take();
 }
 
-#define CHARS_FIELD(structure, field) #field, (structure)->field, sizeof (structure)->field
+#define CHARS_FIELD(structure, field) #field, (structure)->field, sizeof(structure)->field
 
 jobject ckInfoPtrToJInfo(JNIEnv* env, const CK_INFO* ckpInfo) {
     if (ckpInfo == nullptr) return nullptr;

@@ -45,8 +45,8 @@ int jByteArrayToCKByteArray(JNIEnv* env, jbyteArray jArray, CK_BYTE_PTR* ckpArra
 VOK_C_API int jCharArrayToCKCharArray(JNIEnv* env, jcharArray jArray, CK_CHAR_PTR* ckpArray,
                                       CK_ULONG_PTR ckpLength);
 // The same function under its second exported name.
-VOK_C_API int jCharArrayToCKUTF8CharArray(JNIEnv* env, jcharArray jArray,
-                                          CK_UTF8CHAR_PTR* ckpArray, CK_ULONG_PTR ckpLength);
+VOK_C_API int jCharArrayToCKUTF8CharArray(JNIEnv* env, jcharArray jArray, CK_UTF8CHAR_PTR* ckpArray,
+                                          CK_ULONG_PTR ckpLength);
 // An element becomes CK_TRUE only when it is exactly 1.
 int jBooleanArrayToCKBBoolArray(JNIEnv* env, jbooleanArray jArray, CK_BBOOL_PTR* ckpArray,
                                 CK_ULONG_PTR ckpLength);
@@ -82,8 +82,8 @@ void jObjectToPrimitiveCKObjectPtrPtr(JNIEnv* env, jobject jObject, CK_VOID_PTR*
 CK_ATTRIBUTE jAttributeToCKAttribute(JNIEnv* env, jobject jAttribute);
 // CK_CONVERSION_OK, or CK_CONVERSION_FIRST_ALLOCATION_FAILED with an exception
 // pending (nothing to free) when the array or any element could not be made.
-int jAttributeArrayToCKAttributeArray(JNIEnv* env, jobjectArray jArray,
-                                      CK_ATTRIBUTE_PTR* ckpArray, CK_ULONG_PTR ckpCount);
+int jAttributeArrayToCKAttributeArray(JNIEnv* env, jobjectArray jArray, CK_ATTRIBUTE_PTR* ckpArray,
+                                      CK_ULONG_PTR ckpCount);
 // Frees the values jAttributeToCKAttribute made (nested templates included)
 // and sets them null; the second one also frees the array.
 void freeCKAttributeValue(CK_ATTRIBUTE_PTR attribute);
@@ -164,12 +164,11 @@ CK_RC5_CBC_PARAMS jRc5CbcParamToCKRc5CbcParam(JNIEnv* env, jobject jParam);
 CK_RC5_MAC_GENERAL_PARAMS jRc5MacGeneralParamToCKRc5MacGeneralParam(JNIEnv* env, jobject jParam);
 CK_SKIPJACK_PRIVATE_WRAP_PARAMS jSkipjackPrivateWrapParamToCKSkipjackPrivateWrapParam(
     JNIEnv* env, jobject jParam);
-CK_SKIPJACK_RELAYX_PARAMS jSkipjackRelayxParamToCKSkipjackRelayxParam(JNIEnv* env,
-                                                                      jobject jParam);
+CK_SKIPJACK_RELAYX_PARAMS jSkipjackRelayxParamToCKSkipjackRelayxParam(JNIEnv* env, jobject jParam);
 CK_PBE_PARAMS jPbeParamToCKPbeParam(JNIEnv* env, jobject jParam);
 CK_PKCS5_PBKD2_PARAMS jPkcs5Pbkd2ParamToCKPkcs5Pbkd2Param(JNIEnv* env, jobject jParam);
-CK_KEY_DERIVATION_STRING_DATA jKeyDerivationStringDataToCKKeyDerivationStringData(
-    JNIEnv* env, jobject jParam);
+CK_KEY_DERIVATION_STRING_DATA jKeyDerivationStringDataToCKKeyDerivationStringData(JNIEnv* env,
+                                                                                  jobject jParam);
 CK_KEY_WRAP_SET_OAEP_PARAMS jKeyWrapSetOaepParamToCKKeyWrapSetOaepParam(JNIEnv* env,
                                                                         jobject jParam);
 CK_SSL3_MASTER_KEY_DERIVE_PARAMS jSsl3MasterKeyDeriveParamToCKSsl3MasterKeyDeriveParam(
@@ -180,10 +179,8 @@ CK_SSL3_KEY_MAT_PARAMS jSsl3KeyMatParamToCKSsl3KeyMatParam(JNIEnv* env, jobject 
 CK_RSA_PKCS_PSS_PARAMS jRsaPkcsPssParamToCKRsaPkcsPssParam(JNIEnv* env, jobject jParam);
 CK_ECDH1_DERIVE_PARAMS jEcdh1DeriveParamToCKEcdh1DeriveParam(JNIEnv* env, jobject jParam);
 CK_ECDH2_DERIVE_PARAMS jEcdh2DeriveParamToCKEcdh2DeriveParam(JNIEnv* env, jobject jParam);
-CK_X9_42_DH1_DERIVE_PARAMS jX942Dh1DeriveParamToCKX942Dh1DeriveParam(JNIEnv* env,
-                                                                     jobject jParam);
-CK_X9_42_DH2_DERIVE_PARAMS jX942Dh2DeriveParamToCKX942Dh2DeriveParam(JNIEnv* env,
-                                                                     jobject jParam);
+CK_X9_42_DH1_DERIVE_PARAMS jX942Dh1DeriveParamToCKX942Dh1DeriveParam(JNIEnv* env, jobject jParam);
+CK_X9_42_DH2_DERIVE_PARAMS jX942Dh2DeriveParamToCKX942Dh2DeriveParam(JNIEnv* env, jobject jParam);
 CK_DES_CBC_ENCRYPT_DATA_PARAMS jDesCbcEncryptDataParamToCKDesCbcEncryptData(JNIEnv* env,
                                                                             jobject jParam);
 CK_AES_CBC_ENCRYPT_DATA_PARAMS jAesCbcEncryptDataParamToCKAesCbcEncryptData(JNIEnv* env,

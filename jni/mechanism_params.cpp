@@ -29,11 +29,11 @@ std::string objectSignature(const char* simpleName) {
 
 // A byte-array field into a pointer / length pair of a packed structure
 // (whose members cannot be bound to references).
-#define READ_BYTES(fields, params, pointerMember, lengthMember) \
-    do {                                                          \
-        NativeBuffer bytes_ = (fields).getBytes(#pointerMember);  \
-        (params).pointerMember = bytes_.data;                     \
-        (params).lengthMember = bytes_.length;                    \
+#define READ_BYTES(fields, params, pointerMember, lengthMember)  \
+    do {                                                         \
+        NativeBuffer bytes_ = (fields).getBytes(#pointerMember); \
+        (params).pointerMember = bytes_.data;                    \
+        (params).lengthMember = bytes_.length;                   \
     } while (0)
 
 CK_SSL3_RANDOM_DATA readRandomData(JNIEnv* env, ObjectFields& fields) {
@@ -54,7 +54,8 @@ Params readCbcEncryptData(JNIEnv* env, jobject jParam) {
     NativeBuffer iv = fields.getBytes("iv");
     // The iv member has a fixed size (8 or 16 bytes): a longer Java array is
     // cut to it, never copied past the member into the pointer behind it.
-    if (iv.data != nullptr) std::memcpy(params.iv, iv.data, std::min<CK_ULONG>(iv.length, sizeof params.iv));
+    if (iv.data != nullptr)
+        std::memcpy(params.iv, iv.data, std::min<CK_ULONG>(iv.length, sizeof params.iv));
     gConverterFree(iv.data);
     READ_BYTES(fields, params, pData, length);
     return params;
@@ -74,7 +75,8 @@ void convertInto(JNIEnv* env, jobject jParam, void* native) {
     std::memcpy(native, &params, sizeof params);
 }
 
-#define PARAMETER_CLASS(Params, convert) {#Params, sizeof(Params), &convertInto<Params, convert>}
+#define PARAMETER_CLASS(Params, convert) \
+    { #Params, sizeof(Params), &convertInto < Params, convert> }
 
 // Tested in this order; the first class the object is an instance of wins.
 const ParameterClass kParameterClasses[] = {
@@ -454,8 +456,7 @@ CK_SKIPJACK_PRIVATE_WRAP_PARAMS jSkipjackPrivateWrapParamToCKSkipjackPrivateWrap
     return params;
 }
 
-CK_SKIPJACK_RELAYX_PARAMS jSkipjackRelayxParamToCKSkipjackRelayxParam(JNIEnv* env,
-                                                                      jobject jParam) {
+CK_SKIPJACK_RELAYX_PARAMS jSkipjackRelayxParamToCKSkipjackRelayxParam(JNIEnv* env, jobject jParam) {
     CK_SKIPJACK_RELAYX_PARAMS params{};
     ObjectFields fields(env, jParam);
     READ_BYTES(fields, params, pOldWrappedX, ulOldWrappedXLen);
@@ -496,8 +497,8 @@ CK_PKCS5_PBKD2_PARAMS jPkcs5Pbkd2ParamToCKPkcs5Pbkd2Param(JNIEnv* env, jobject j
     return params;
 }
 
-CK_KEY_DERIVATION_STRING_DATA jKeyDerivationStringDataToCKKeyDerivationStringData(
-    JNIEnv* env, jobject jParam) {
+CK_KEY_DERIVATION_STRING_DATA jKeyDerivationStringDataToCKKeyDerivationStringData(JNIEnv* env,
+                                                                                  jobject jParam) {
     CK_KEY_DERIVATION_STRING_DATA params{};
     ObjectFields fields(env, jParam);
     READ_BYTES(fields, params, pData, ulLen);
@@ -584,8 +585,7 @@ CK_ECDH2_DERIVE_PARAMS jEcdh2DeriveParamToCKEcdh2DeriveParam(JNIEnv* env, jobjec
     return params;
 }
 
-CK_X9_42_DH1_DERIVE_PARAMS jX942Dh1DeriveParamToCKX942Dh1DeriveParam(JNIEnv* env,
-                                                                     jobject jParam) {
+CK_X9_42_DH1_DERIVE_PARAMS jX942Dh1DeriveParamToCKX942Dh1DeriveParam(JNIEnv* env, jobject jParam) {
     CK_X9_42_DH1_DERIVE_PARAMS params{};
     ObjectFields fields(env, jParam);
     params.kdf = fields.getULong("kdf");
@@ -594,8 +594,7 @@ CK_X9_42_DH1_DERIVE_PARAMS jX942Dh1DeriveParamToCKX942Dh1DeriveParam(JNIEnv* env
     return params;
 }
 
-CK_X9_42_DH2_DERIVE_PARAMS jX942Dh2DeriveParamToCKX942Dh2DeriveParam(JNIEnv* env,
-                                                                     jobject jParam) {
+CK_X9_42_DH2_DERIVE_PARAMS jX942Dh2DeriveParamToCKX942Dh2DeriveParam(JNIEnv* env, jobject jParam) {
     CK_X9_42_DH2_DERIVE_PARAMS params{};
     ObjectFields fields(env, jParam);
     params.kdf = fields.getULong("kdf");
@@ -622,15 +621,16 @@ CK_AES_CBC_ENCRYPT_DATA_PARAMS jAesCbcEncryptDataParamToCKAesCbcEncryptData(JNIE
 void copyBackPBEInitializationVector(JNIEnv* env, CK_MECHANISM_PTR ckMechanism,
                                      jobject jMechanism) {
     jobject jParamRef = nullptr;
-    const auto* native = copyBackSource<CK_PBE_PARAMS>(env, ckMechanism, jMechanism,
-                                                       isPbeWithInitVector, "CK_PBE_PARAMS",
-                                                       &jParamRef);
+    const auto* native = copyBackSource<CK_PBE_PARAMS>(
+        env, ckMechanism, jMechanism, isPbeWithInitVector, "CK_PBE_PARAMS", &jParamRef);
     LocalRef<jobject> jParam(env, jParamRef);
     if (native == nullptr || native->pInitVector == nullptr) return;
     ObjectFields fields(env, jParam.get());
     // The IV comes back in "pInitVektor", not in the pInitVector it went out in.
-    LocalRef<jcharArray> target(env, static_cast<jcharArray>(fields.getObject("pInitVektor", "[C")));
-    LocalRef<jcharArray> source(env, static_cast<jcharArray>(fields.getObject("pInitVector", "[C")));
+    LocalRef<jcharArray> target(env,
+                                static_cast<jcharArray>(fields.getObject("pInitVektor", "[C")));
+    LocalRef<jcharArray> source(env,
+                                static_cast<jcharArray>(fields.getObject("pInitVector", "[C")));
     if (fields.failed() || target.get() == nullptr) return;
     // The native buffer is as long as pInitVector: no more than that is read.
     jsize count = std::min(env->GetArrayLength(target.get()),

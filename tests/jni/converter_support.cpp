@@ -68,6 +68,15 @@ std::u16string charsValue(int seed) {
     return chars;
 }
 
+// The bytes of a fixed-size character field, high bits set so that a
+// conversion widening with sign shows.
+Bytes fixedBytes(int seed, std::size_t size) {
+    Bytes bytes(size);
+    for (std::size_t k = 0; k < size; ++k)
+        bytes[k] = static_cast<uint8_t>(((seed << 4) + k) ^ 0x80);
+    return bytes;
+}
+
 template <typename T>
 T readAt(const void* base, std::size_t offset) {
     T value;
@@ -82,46 +91,36 @@ void cover(std::vector<bool>& covered, std::size_t from, std::size_t count) {
 std::string nestedSignature(const Member& m) { return "L" + fullName(m.className) + ";"; }
 
 void checkMembers(const uint8_t* base, std::vector<bool>& covered, std::size_t at,
-                  const std::vector<Member>& members, int& seed,
-                  const TrackedAllocations& tracked, const std::string& where) {
+                  const std::vector<Member>& members, int& seed, const TrackedAllocations& tracked,
+                  const std::string& where) {
     for (const Member& m : members) {
         std::string what = where + "." + m.name;
         std::size_t o = at + m.offset;
         int s = seed++;
-        switch (m.kind) {
-            case Kind::Long:
-                EXPECT_EQ(readAt<CK_ULONG>(base, o), static_cast<CK_ULONG>(longValue(s))) << what;
-                cover(covered, o, sizeof(CK_ULONG));
-                break;
-            case Kind::Bool:
-            case Kind::Byte:
-                EXPECT_EQ(base[o], m.kind == Kind::Bool ? 1 : byteValue(s)) << what;
-                cover(covered, o, 1);
-                break;
-            case Kind::Bytes:
-            case Kind::Chars: {
-                auto* data = readAt<uint8_t*>(base, o);
-                Bytes expected = bytesValue(s);
-                ASSERT_NE(data, nullptr) << what;
-                EXPECT_EQ(tracked.sizeOf(data), expected.size()) << what;
-                EXPECT_EQ(nativeBytes(data, expected.size()), expected) << what;
-                cover(covered, o, sizeof data);
-                if (m.lengthOffset != kNoLength) {
-                    EXPECT_EQ(readAt<CK_ULONG>(base, at + m.lengthOffset), expected.size()) << what;
-                    cover(covered, at + m.lengthOffset, sizeof(CK_ULONG));
-                }
-                break;
+        if (m.kind == Kind::Long) {
+            EXPECT_EQ(readAt<CK_ULONG>(base, o), static_cast<CK_ULONG>(longValue(s))) << what;
+            cover(covered, o, sizeof(CK_ULONG));
+        } else if (m.kind == Kind::Bool || m.kind == Kind::Byte) {
+            EXPECT_EQ(base[o], m.kind == Kind::Bool ? 1 : byteValue(s)) << what;
+            cover(covered, o, 1);
+        } else if (m.kind == Kind::Embedded) {
+            checkMembers(base, covered, o, m.members, seed, tracked, what);
+        } else {
+            // A buffer or a structure behind a pointer, of its own exact size.
+            auto* data = readAt<uint8_t*>(base, o);
+            cover(covered, o, sizeof data);
+            ASSERT_NE(data, nullptr) << what;
+            Bytes expected = bytesValue(s);
+            std::size_t size = m.kind == Kind::Pointed ? m.size : expected.size();
+            EXPECT_EQ(tracked.sizeOf(data), size) << what;
+            if (m.kind == Kind::Pointed) {
+                checkNative(data, m.size, m.members, seed, tracked, what);
+                continue;
             }
-            case Kind::Embedded:
-                checkMembers(base, covered, o, m.members, seed, tracked, what);
-                break;
-            case Kind::Pointed: {
-                auto* pointed = readAt<uint8_t*>(base, o);
-                cover(covered, o, sizeof pointed);
-                ASSERT_NE(pointed, nullptr) << what;
-                EXPECT_EQ(tracked.sizeOf(pointed), m.size) << what;
-                checkNative(pointed, m.size, m.members, seed, tracked, what);
-                break;
+            EXPECT_EQ(nativeBytes(data, expected.size()), expected) << what;
+            if (m.lengthOffset != kNoLength) {
+                EXPECT_EQ(readAt<CK_ULONG>(base, at + m.lengthOffset), expected.size()) << what;
+                cover(covered, at + m.lengthOffset, sizeof(CK_ULONG));
             }
         }
     }
@@ -187,18 +186,15 @@ jcharArray newChars(JNIEnv* env, const std::u16string& chars) {
     return array;
 }
 
-void setField(JNIEnv* env, jobject object, const char* name, const char* signature,
-              jvalue value) {
+void setField(JNIEnv* env, jobject object, const char* name, const char* signature, jvalue value) {
     jclass cls = env->GetObjectClass(object);
     jfieldID id = env->GetFieldID(cls, name, signature);
-    ASSERT_NE(id, nullptr) << name;
-    switch (signature[0]) {
-        case 'J': env->SetLongField(object, id, value.j); break;
-        case 'Z': env->SetBooleanField(object, id, value.z); break;
-        case 'B': env->SetByteField(object, id, value.b); break;
-        default: env->SetObjectField(object, id, value.l); break;
-    }
     env->DeleteLocalRef(cls);
+    ASSERT_NE(id, nullptr) << name;
+    if (*signature == 'J') env->SetLongField(object, id, value.j);
+    if (*signature == 'Z') env->SetBooleanField(object, id, value.z);
+    if (*signature == 'B') env->SetByteField(object, id, value.b);
+    if (*signature == 'L' || *signature == '[') env->SetObjectField(object, id, value.l);
 }
 
 jvalue getField(JNIEnv* env, jobject object, const char* name, const char* signature) {
@@ -206,17 +202,12 @@ jvalue getField(JNIEnv* env, jobject object, const char* name, const char* signa
     jclass cls = env->GetObjectClass(object);
     jfieldID id = env->GetFieldID(cls, name, signature);
     env->DeleteLocalRef(cls);
-    if (id == nullptr) {
-        ADD_FAILURE() << "no field " << name;
-        env->ExceptionClear();
-        return value;
-    }
-    switch (signature[0]) {
-        case 'J': value.j = env->GetLongField(object, id); break;
-        case 'Z': value.z = env->GetBooleanField(object, id); break;
-        case 'B': value.b = env->GetByteField(object, id); break;
-        default: value.l = env->GetObjectField(object, id); break;
-    }
+    EXPECT_NE(id, nullptr) << name;
+    if (id == nullptr) env->ExceptionClear();
+    if (id != nullptr && *signature == 'J') value.j = env->GetLongField(object, id);
+    if (id != nullptr && *signature == 'B') value.b = env->GetByteField(object, id);
+    if (id != nullptr && (*signature == 'L' || *signature == '['))
+        value.l = env->GetObjectField(object, id);
     return value;
 }
 
@@ -238,18 +229,9 @@ std::u16string charsOf(JNIEnv* env, jobject charArray) {
     return chars;
 }
 
-std::string classNameOf(JNIEnv* env, jobject object) {
-    if (object == nullptr) return "null";
-    jclass cls = env->GetObjectClass(object);
-    jclass classClass = env->GetObjectClass(cls);
-    auto name = static_cast<jstring>(env->CallObjectMethod(
-        cls, env->GetMethodID(classClass, "getName", "()Ljava/lang/String;")));
-    if (env->ExceptionCheck()) return "exception";
-    const char* chars = env->GetStringUTFChars(name, nullptr);
-    std::string result = chars;
-    env->ReleaseStringUTFChars(name, chars);
-    env->DeleteLocalRef(name);
-    env->DeleteLocalRef(classClass);
+bool isA(JNIEnv* env, jobject object, const char* className) {
+    jclass cls = env->FindClass(fullName(className).c_str());
+    bool result = object != nullptr && cls != nullptr && env->IsInstanceOf(object, cls);
     env->DeleteLocalRef(cls);
     return result;
 }
@@ -259,25 +241,36 @@ Bytes nativeBytes(const void* data, std::size_t size) {
     return bytes != nullptr ? Bytes(bytes, bytes + size) : Bytes();
 }
 
+Member member(Kind kind, const char* name, std::size_t offset, std::size_t lengthOffset,
+              std::size_t size) {
+    return Member{kind, name, offset, lengthOffset, size};
+}
+
+Member version(const char* name, std::size_t offset) {
+    return Member{Kind::Embedded,
+                  name,
+                  offset,
+                  kNoLength,
+                  sizeof(CK_VERSION),
+                  "CK_VERSION",
+                  {member(Kind::Byte, "major", 0), member(Kind::Byte, "minor", 1)}};
+}
+
 jobject buildJava(JNIEnv* env, const char* className, const std::vector<Member>& members,
                   int& seed) {
+    static const char* const kSignatures[] = {"J", "Z", "B", "[B", "[C"};
     jobject object = newObject(env, className);
     for (const Member& m : members) {
         int s = seed++;
         jvalue v{};
-        std::string signature;
-        switch (m.kind) {
-            case Kind::Long: v.j = longValue(s); signature = "J"; break;
-            case Kind::Bool: v.z = JNI_TRUE; signature = "Z"; break;
-            case Kind::Byte: v.b = static_cast<jbyte>(byteValue(s)); signature = "B"; break;
-            case Kind::Bytes: v.l = newBytes(env, bytesValue(s)); signature = "[B"; break;
-            case Kind::Chars: v.l = newChars(env, charsValue(s)); signature = "[C"; break;
-            case Kind::Embedded:
-            case Kind::Pointed:
-                v.l = buildJava(env, m.className, m.members, seed);
-                signature = nestedSignature(m);
-                break;
-        }
+        if (m.kind == Kind::Long) v.j = longValue(s);
+        if (m.kind == Kind::Bool) v.z = JNI_TRUE;
+        if (m.kind == Kind::Byte) v.b = static_cast<jbyte>(byteValue(s));
+        if (m.kind == Kind::Bytes) v.l = newBytes(env, bytesValue(s));
+        if (m.kind == Kind::Chars) v.l = newChars(env, charsValue(s));
+        if (m.className != nullptr) v.l = buildJava(env, m.className, m.members, seed);
+        std::string signature =
+            m.className != nullptr ? nestedSignature(m) : kSignatures[static_cast<int>(m.kind)];
         setField(env, object, m.name, signature.c_str(), v);
         if (signature.size() > 1) env->DeleteLocalRef(v.l);
     }
@@ -294,48 +287,65 @@ void checkNative(const void* native, std::size_t size, const std::vector<Member>
         }
 }
 
-void checkJava(JNIEnv* env, jobject object, const void* native, std::size_t size,
-               const std::vector<Member>& members, const std::string& where) {
+void invertNative(void* native, const std::vector<Member>& members, int& seed) {
+    for (const Member& m : members) {
+        int s = seed++;
+        uint8_t* at = static_cast<uint8_t*>(native) + m.offset;
+        std::size_t size = m.kind == Kind::Long ? sizeof(CK_ULONG) : 1;
+        if (m.kind == Kind::Bytes || m.kind == Kind::Chars) {
+            size = bytesValue(s).size();
+            at = readAt<uint8_t*>(at, 0);
+        }
+        if (m.kind == Kind::Embedded) invertNative(at, m.members, seed);
+        if (m.kind == Kind::Pointed) invertNative(readAt<uint8_t*>(at, 0), m.members, seed);
+        for (std::size_t i = 0; m.className == nullptr && i < size; ++i)
+            at[i] = static_cast<uint8_t>(~at[i]);
+    }
+}
+
+void fillNative(void* native, const std::vector<Member>& members, int& seed) {
+    for (const Member& m : members) {
+        int s = seed++;
+        uint8_t* at = static_cast<uint8_t*>(native) + m.offset;
+        jlong l = longValue(s);
+        if (m.kind == Kind::Long) std::memcpy(at, &l, sizeof l);
+        if (m.kind == Kind::Byte) *at = byteValue(s);
+        if (m.kind == Kind::Chars) std::memcpy(at, fixedBytes(s, m.size).data(), m.size);
+        if (m.kind == Kind::Embedded) fillNative(at, m.members, seed);
+    }
+}
+
+void checkJavaValues(JNIEnv* env, jobject object, const std::vector<Member>& members, int& seed,
+                     bool inverted, const std::string& where) {
     ASSERT_NE(object, nullptr) << where;
-    std::size_t covered = 0;
     for (const Member& m : members) {
         std::string what = where + "." + m.name;
-        switch (m.kind) {
-            case Kind::Long:
-                EXPECT_EQ(static_cast<CK_ULONG>(getField(env, object, m.name, "J").j),
-                          readAt<CK_ULONG>(native, m.offset))
-                    << what;
-                covered += sizeof(CK_ULONG);
-                break;
-            case Kind::Byte:
-                EXPECT_EQ(static_cast<uint8_t>(getField(env, object, m.name, "B").b),
-                          readAt<uint8_t>(native, m.offset))
-                    << what;
-                covered += 1;
-                break;
-            case Kind::Chars: {
-                jobject chars = getField(env, object, m.name, "[C").l;
-                std::u16string expected;
-                for (uint8_t b : nativeBytes(static_cast<const uint8_t*>(native) + m.offset, m.size))
-                    expected += static_cast<char16_t>(b);
-                EXPECT_EQ(charsOf(env, chars), expected) << what;
-                env->DeleteLocalRef(chars);
-                covered += m.size;
-                break;
-            }
-            case Kind::Embedded: {
-                jobject nested = getField(env, object, m.name, nestedSignature(m).c_str()).l;
-                checkJava(env, nested, static_cast<const uint8_t*>(native) + m.offset, m.size,
-                          m.members, what);
-                env->DeleteLocalRef(nested);
-                covered += m.size;
-                break;
-            }
-            default:
-                ADD_FAILURE() << what << ": kind not used for information structures";
+        int s = seed++;
+        auto invert = [inverted](Bytes b) {
+            for (uint8_t& x : b) x = static_cast<uint8_t>(inverted ? ~x : x);
+            return b;
+        };
+        if (m.kind == Kind::Long) {
+            EXPECT_EQ(getField(env, object, m.name, "J").j, inverted ? ~longValue(s) : longValue(s))
+                << what;
+        } else if (m.kind == Kind::Byte) {
+            EXPECT_EQ(static_cast<uint8_t>(getField(env, object, m.name, "B").b),
+                      invert({byteValue(s)})[0])
+                << what;
+        } else if (m.kind == Kind::Bytes) {
+            EXPECT_EQ(bytesOf(env, getField(env, object, m.name, "[B").l), invert(bytesValue(s)))
+                << what;
+        } else if (m.kind == Kind::Chars) {
+            std::u16string expected = charsValue(s);
+            Bytes fixed = fixedBytes(s, m.size);
+            if (m.size != 0) expected.assign(fixed.begin(), fixed.end());
+            EXPECT_EQ(charsOf(env, getField(env, object, m.name, "[C").l), expected) << what;
+        } else {
+            jobject nested = getField(env, object, m.name, nestedSignature(m).c_str()).l;
+            checkJavaValues(env, nested, m.members, seed, inverted, what);
+            env->DeleteLocalRef(nested);
         }
     }
-    EXPECT_EQ(covered, size) << where << ": the table leaves members out";
 }
 
 }  // namespace convtest

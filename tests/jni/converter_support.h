@@ -10,6 +10,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <cstring>
 #include <string>
 #include <vector>
 
@@ -30,8 +31,16 @@ public:
     void failAllocation(int nth);  // 1: the next one
     std::size_t live() const;
     std::size_t sizeOf(const void* buffer) const;  // 0 when not live
-    void release(void* buffer);  // a buffer the code under test leaves allocated
+    void release(void* buffer);                    // a buffer the code under test leaves allocated
 };
+
+// A jvalue holding v in its member of v's type.
+template <typename T>
+jvalue jv(T v) {
+    jvalue value{};
+    std::memcpy(&value, &v, sizeof v);
+    return value;
+}
 
 // JNI helpers; classes without a '/' are the binding's own.
 jobject newObject(JNIEnv* env, const char* className);
@@ -42,7 +51,7 @@ void setField(JNIEnv* env, jobject object, const char* name, const char* signatu
 jvalue getField(JNIEnv* env, jobject object, const char* name, const char* signature);
 Bytes bytesOf(JNIEnv* env, jobject byteArray);
 std::u16string charsOf(JNIEnv* env, jobject charArray);
-std::string classNameOf(JNIEnv* env, jobject object);
+bool isA(JNIEnv* env, jobject object, const char* className);  // false for null
 Bytes nativeBytes(const void* data, std::size_t size);
 
 // One member of a native structure and the Java field it mirrors.
@@ -57,19 +66,21 @@ struct Member {
     const char* className = nullptr;       // Embedded / Pointed
     std::vector<Member> members = {};      // Embedded / Pointed
 };
-#define VOK_LONG(S, f) convtest::Member{convtest::Kind::Long, #f, offsetof(S, f)}
-#define VOK_BOOL(S, f) convtest::Member{convtest::Kind::Bool, #f, offsetof(S, f)}
-#define VOK_BYTE(S, f) convtest::Member{convtest::Kind::Byte, #f, offsetof(S, f)}
-#define VOK_BYTES(S, p, len) convtest::Member{convtest::Kind::Bytes, #p, offsetof(S, p), offsetof(S, len)}
-#define VOK_BYTES_ONLY(S, p) convtest::Member{convtest::Kind::Bytes, #p, offsetof(S, p)}
-#define VOK_CHARS(S, p, len) convtest::Member{convtest::Kind::Chars, #p, offsetof(S, p), offsetof(S, len)}
-#define VOK_CHARS_ONLY(S, p) convtest::Member{convtest::Kind::Chars, #p, offsetof(S, p)}
+Member member(Kind kind, const char* name, std::size_t offset, std::size_t lengthOffset = kNoLength,
+              std::size_t size = 0);
+Member version(const char* name, std::size_t offset);  // an embedded CK_VERSION
+#define VOK_LONG(S, f) convtest::member(convtest::Kind::Long, #f, offsetof(S, f))
+#define VOK_BOOL(S, f) convtest::member(convtest::Kind::Bool, #f, offsetof(S, f))
+#define VOK_BYTE(S, f) convtest::member(convtest::Kind::Byte, #f, offsetof(S, f))
+#define VOK_BYTES(S, p, len) \
+    convtest::member(convtest::Kind::Bytes, #p, offsetof(S, p), offsetof(S, len))
+#define VOK_BYTES_ONLY(S, p) convtest::member(convtest::Kind::Bytes, #p, offsetof(S, p))
+#define VOK_CHARS(S, p, len) \
+    convtest::member(convtest::Kind::Chars, #p, offsetof(S, p), offsetof(S, len))
+#define VOK_CHARS_ONLY(S, p) convtest::member(convtest::Kind::Chars, #p, offsetof(S, p))
 #define VOK_FIXED_CHARS(S, f) \
-    convtest::Member{convtest::Kind::Chars, #f, offsetof(S, f), convtest::kNoLength, sizeof(S::f)}
-#define VOK_VERSION(S, f)                                                                       \
-    convtest::Member{convtest::Kind::Embedded, #f, offsetof(S, f), convtest::kNoLength,       \
-                     sizeof(CK_VERSION), "CK_VERSION",                                         \
-                     {VOK_BYTE(CK_VERSION, major), VOK_BYTE(CK_VERSION, minor)}}
+    convtest::member(convtest::Kind::Chars, #f, offsetof(S, f), convtest::kNoLength, sizeof(S::f))
+#define VOK_VERSION(S, f) convtest::version(#f, offsetof(S, f))
 
 // Builds a Java object of className with a distinct value in every member;
 // seed numbers the values in member order, so a check with the same start
@@ -80,10 +91,16 @@ jobject buildJava(JNIEnv* env, const char* className, const std::vector<Member>&
 // and that every byte no member describes is zero.
 void checkNative(const void* native, std::size_t size, const std::vector<Member>& members,
                  int& seed, const TrackedAllocations& tracked, const std::string& where);
-// Checks a Java object made from a native structure, field by field, and that
-// the members cover the whole structure.
-void checkJava(JNIEnv* env, jobject object, const void* native, std::size_t size,
-               const std::vector<Member>& members, const std::string& where);
+// Plays a module that writes results: every value the members describe in
+// the native structure is inverted (buffers byte by byte).
+void invertNative(void* native, const std::vector<Member>& members, int& seed);
+// Checks the Java object's fields against the values buildJava or
+// fillNative put there, or against their inversions.
+void checkJavaValues(JNIEnv* env, jobject object, const std::vector<Member>& members, int& seed,
+                     bool inverted, const std::string& where);
+// Fills a native structure's members with distinct values (fixed chars
+// with high bits set), for a conversion to Java checked by checkJavaValues.
+void fillNative(void* native, const std::vector<Member>& members, int& seed);
 
 }  // namespace convtest
 

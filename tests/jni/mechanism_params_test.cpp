@@ -4,10 +4,9 @@
 #include <gtest/gtest.h>
 
 #include <csignal>
-#include <cstdio>
 #include <cstring>
-#include <stdexcept>
 #include <functional>
+#include <stdexcept>
 #include <string>
 
 #include "converter_support.h"
@@ -28,15 +27,39 @@ struct ParameterRow {
     std::vector<std::size_t> leftAllocated = {};  // pointers the rule leaves
 };
 
-#define ROW(S, mechanism, ...) ParameterRow{#S, mechanism, sizeof(S), __VA_ARGS__}
-
-const std::vector<Member> kRandomData = {
-    VOK_BYTES(CK_SSL3_RANDOM_DATA, pClientRandom, ulClientRandomLen),
-    VOK_BYTES(CK_SSL3_RANDOM_DATA, pServerRandom, ulServerRandomLen)};
+#define ROW(S, mechanism, ...) \
+    ParameterRow { #S, mechanism, sizeof(S), __VA_ARGS__ }
 
 Member randomInfo(std::size_t offset) {
-    return {Kind::Embedded, "RandomInfo", offset, kNoLength, 0, "CK_SSL3_RANDOM_DATA", kRandomData};
+    return {Kind::Embedded,
+            "RandomInfo",
+            offset,
+            kNoLength,
+            0,
+            "CK_SSL3_RANDOM_DATA",
+            {VOK_BYTES(CK_SSL3_RANDOM_DATA, pClientRandom, ulClientRandomLen),
+             VOK_BYTES(CK_SSL3_RANDOM_DATA, pServerRandom, ulServerRandomLen)}};
 }
+
+// The two structures that parameters point to; the module writes into them.
+const Member kVersionPointer{Kind::Pointed,
+                             "pVersion",
+                             offsetof(CK_SSL3_MASTER_KEY_DERIVE_PARAMS, pVersion),
+                             kNoLength,
+                             sizeof(CK_VERSION),
+                             "CK_VERSION",
+                             {VOK_BYTE(CK_VERSION, major), VOK_BYTE(CK_VERSION, minor)}};
+const Member kKeyMaterialPointer{
+    Kind::Pointed,
+    "pReturnedKeyMaterial",
+    offsetof(CK_SSL3_KEY_MAT_PARAMS, pReturnedKeyMaterial),
+    kNoLength,
+    sizeof(CK_SSL3_KEY_MAT_OUT),
+    "CK_SSL3_KEY_MAT_OUT",
+    {VOK_LONG(CK_SSL3_KEY_MAT_OUT, hClientMacSecret),
+     VOK_LONG(CK_SSL3_KEY_MAT_OUT, hServerMacSecret), VOK_LONG(CK_SSL3_KEY_MAT_OUT, hClientKey),
+     VOK_LONG(CK_SSL3_KEY_MAT_OUT, hServerKey), VOK_BYTES_ONLY(CK_SSL3_KEY_MAT_OUT, pIVClient),
+     VOK_BYTES_ONLY(CK_SSL3_KEY_MAT_OUT, pIVServer)}};
 
 // Every parameter class but RC2-CBC, in the dispatcher's order.
 const std::vector<ParameterRow>& parameterRows() {
@@ -47,7 +70,14 @@ const std::vector<ParameterRow>& parameterRows() {
     using PBKD2 = CK_PKCS5_PBKD2_PARAMS;
     using MASTER = CK_SSL3_MASTER_KEY_DERIVE_PARAMS;
     using KEYMAT = CK_SSL3_KEY_MAT_PARAMS;
-    using OUT = CK_SSL3_KEY_MAT_OUT;
+    using RC2MAC = CK_RC2_MAC_GENERAL_PARAMS;
+    using RC5 = CK_RC5_PARAMS;
+    using RC5CBC = CK_RC5_CBC_PARAMS;
+    using RC5MAC = CK_RC5_MAC_GENERAL_PARAMS;
+    using PBE = CK_PBE_PARAMS;
+    using PSS = CK_RSA_PKCS_PSS_PARAMS;
+    using ECDH1 = CK_ECDH1_DERIVE_PARAMS;
+    using DH1 = CK_X9_42_DH1_DERIVE_PARAMS;
     using ECDH2 = CK_ECDH2_DERIVE_PARAMS;
     using DH2 = CK_X9_42_DH2_DERIVE_PARAMS;
     static const std::vector<ParameterRow> rows = {
@@ -59,17 +89,14 @@ const std::vector<ParameterRow>& parameterRows() {
             {VOK_BOOL(KEA, isSender), VOK_BYTES_ONLY(KEA, pRandomA),
              VOK_BYTES(KEA, pRandomB, ulRandomLen), VOK_BYTES(KEA, pPublicData, ulPublicDataLen)}),
         ROW(CK_RC2_MAC_GENERAL_PARAMS, CKM_RC2_MAC_GENERAL,
-            {VOK_LONG(CK_RC2_MAC_GENERAL_PARAMS, ulEffectiveBits),
-             VOK_LONG(CK_RC2_MAC_GENERAL_PARAMS, ulMacLength)}),
-        ROW(CK_RC5_PARAMS, CKM_RC5_ECB,
-            {VOK_LONG(CK_RC5_PARAMS, ulWordsize), VOK_LONG(CK_RC5_PARAMS, ulRounds)}),
+            {VOK_LONG(RC2MAC, ulEffectiveBits), VOK_LONG(RC2MAC, ulMacLength)}),
+        ROW(CK_RC5_PARAMS, CKM_RC5_ECB, {VOK_LONG(RC5, ulWordsize), VOK_LONG(RC5, ulRounds)}),
         ROW(CK_RC5_CBC_PARAMS, CKM_RC5_CBC_PAD,
-            {VOK_LONG(CK_RC5_CBC_PARAMS, ulWordsize), VOK_LONG(CK_RC5_CBC_PARAMS, ulRounds),
-             VOK_BYTES(CK_RC5_CBC_PARAMS, pIv, ulIvLen)}),
+            {VOK_LONG(RC5CBC, ulWordsize), VOK_LONG(RC5CBC, ulRounds),
+             VOK_BYTES(RC5CBC, pIv, ulIvLen)}),
         ROW(CK_RC5_MAC_GENERAL_PARAMS, CKM_RC5_MAC_GENERAL,
-            {VOK_LONG(CK_RC5_MAC_GENERAL_PARAMS, ulWordsize),
-             VOK_LONG(CK_RC5_MAC_GENERAL_PARAMS, ulRounds),
-             VOK_LONG(CK_RC5_MAC_GENERAL_PARAMS, ulMacLength)}),
+            {VOK_LONG(RC5MAC, ulWordsize), VOK_LONG(RC5MAC, ulRounds),
+             VOK_LONG(RC5MAC, ulMacLength)}),
         ROW(CK_SKIPJACK_PRIVATE_WRAP_PARAMS, CKM_SKIPJACK_PRIVATE_WRAP,
             {VOK_BYTES(SPW, pPassword, ulPasswordLen), VOK_BYTES(SPW, pPublicData, ulPublicDataLen),
              VOK_BYTES(SPW, pRandomA, ulRandomLen), VOK_BYTES(SPW, pPrimeP, ulPAndGLen),
@@ -83,9 +110,8 @@ const std::vector<ParameterRow>& parameterRows() {
              VOK_BYTES(RELAYX, pNewPublicData, ulNewPublicDataLen),
              VOK_BYTES(RELAYX, pNewRandomA, ulNewRandomLen)}),
         ROW(CK_PBE_PARAMS, CKM_PBA_SHA1_WITH_SHA1_HMAC,
-            {VOK_CHARS_ONLY(CK_PBE_PARAMS, pInitVector),
-             VOK_CHARS(CK_PBE_PARAMS, pPassword, ulPasswordLen),
-             VOK_CHARS(CK_PBE_PARAMS, pSalt, ulSaltLen), VOK_LONG(CK_PBE_PARAMS, ulIteration)}),
+            {VOK_CHARS_ONLY(PBE, pInitVector), VOK_CHARS(PBE, pPassword, ulPasswordLen),
+             VOK_CHARS(PBE, pSalt, ulSaltLen), VOK_LONG(PBE, ulIteration)}),
         // The password stays null: every byte no member names must be zero.
         ROW(CK_PKCS5_PBKD2_PARAMS, CKM_PKCS5_PBKD2,
             {VOK_LONG(PBKD2, saltSource), VOK_BYTES(PBKD2, pSaltSourceData, ulSaltSourceDataLen),
@@ -97,34 +123,25 @@ const std::vector<ParameterRow>& parameterRows() {
             {VOK_BYTE(CK_KEY_WRAP_SET_OAEP_PARAMS, bBC),
              VOK_BYTES(CK_KEY_WRAP_SET_OAEP_PARAMS, pX, ulXLen)}),
         ROW(CK_SSL3_MASTER_KEY_DERIVE_PARAMS, CKM_TLS_MASTER_KEY_DERIVE_DH,
-            {randomInfo(offsetof(MASTER, RandomInfo)),
-             {Kind::Pointed, "pVersion", offsetof(MASTER, pVersion), kNoLength, sizeof(CK_VERSION),
-              "CK_VERSION", {VOK_BYTE(CK_VERSION, major), VOK_BYTE(CK_VERSION, minor)}}}),
+            {randomInfo(offsetof(MASTER, RandomInfo)), kVersionPointer}),
+        // The rule leaves the key material structure allocated.
         ROW(CK_SSL3_KEY_MAT_PARAMS, CKM_TLS_KEY_AND_MAC_DERIVE,
             {VOK_LONG(KEYMAT, ulMacSizeInBits), VOK_LONG(KEYMAT, ulKeySizeInBits),
              VOK_LONG(KEYMAT, ulIVSizeInBits), VOK_BOOL(KEYMAT, bIsExport),
-             randomInfo(offsetof(KEYMAT, RandomInfo)),
-             {Kind::Pointed, "pReturnedKeyMaterial", offsetof(KEYMAT, pReturnedKeyMaterial),
-              kNoLength, sizeof(OUT), "CK_SSL3_KEY_MAT_OUT",
-              {VOK_LONG(OUT, hClientMacSecret), VOK_LONG(OUT, hServerMacSecret),
-               VOK_LONG(OUT, hClientKey), VOK_LONG(OUT, hServerKey),
-               VOK_BYTES_ONLY(OUT, pIVClient), VOK_BYTES_ONLY(OUT, pIVServer)}}},
+             randomInfo(offsetof(KEYMAT, RandomInfo)), kKeyMaterialPointer},
             {offsetof(KEYMAT, pReturnedKeyMaterial)}),
         ROW(CK_RSA_PKCS_PSS_PARAMS, CKM_RSA_PKCS_PSS,
-            {VOK_LONG(CK_RSA_PKCS_PSS_PARAMS, hashAlg), VOK_LONG(CK_RSA_PKCS_PSS_PARAMS, mgf),
-             VOK_LONG(CK_RSA_PKCS_PSS_PARAMS, sLen)}),
+            {VOK_LONG(PSS, hashAlg), VOK_LONG(PSS, mgf), VOK_LONG(PSS, sLen)}),
         ROW(CK_ECDH1_DERIVE_PARAMS, CKM_ECDH1_COFACTOR_DERIVE,
-            {VOK_LONG(CK_ECDH1_DERIVE_PARAMS, kdf),
-             VOK_BYTES(CK_ECDH1_DERIVE_PARAMS, pSharedData, ulSharedDataLen),
-             VOK_BYTES(CK_ECDH1_DERIVE_PARAMS, pPublicData, ulPublicDataLen)}),
+            {VOK_LONG(ECDH1, kdf), VOK_BYTES(ECDH1, pSharedData, ulSharedDataLen),
+             VOK_BYTES(ECDH1, pPublicData, ulPublicDataLen)}),
         ROW(CK_ECDH2_DERIVE_PARAMS, CKM_ECMQV_DERIVE,
             {VOK_LONG(ECDH2, kdf), VOK_BYTES(ECDH2, pSharedData, ulSharedDataLen),
              VOK_BYTES(ECDH2, pPublicData, ulPublicDataLen), VOK_LONG(ECDH2, ulPrivateDataLen),
              VOK_LONG(ECDH2, hPrivateData), VOK_BYTES(ECDH2, pPublicData2, ulPublicDataLen2)}),
         ROW(CK_X9_42_DH1_DERIVE_PARAMS, CKM_X9_42_DH_DERIVE,
-            {VOK_LONG(CK_X9_42_DH1_DERIVE_PARAMS, kdf),
-             VOK_BYTES(CK_X9_42_DH1_DERIVE_PARAMS, pOtherInfo, ulOtherInfoLen),
-             VOK_BYTES(CK_X9_42_DH1_DERIVE_PARAMS, pPublicData, ulPublicDataLen)}),
+            {VOK_LONG(DH1, kdf), VOK_BYTES(DH1, pOtherInfo, ulOtherInfoLen),
+             VOK_BYTES(DH1, pPublicData, ulPublicDataLen)}),
         ROW(CK_X9_42_DH2_DERIVE_PARAMS, CKM_X9_42_MQV_DERIVE,
             {VOK_LONG(DH2, kdf), VOK_BYTES(DH2, pOtherInfo, ulOtherInfoLen),
              VOK_BYTES(DH2, pPublicData, ulPublicDataLen), VOK_LONG(DH2, ulPrivateDataLen),
@@ -154,11 +171,8 @@ void* pointerAt(const void* base, std::size_t offset) {
 
 jobject newMechanism(JNIEnv* env, CK_MECHANISM_TYPE type, jobject parameter) {
     jobject mechanism = newObject(env, "CK_MECHANISM");
-    jvalue v;
-    v.j = static_cast<jlong>(type);
-    setField(env, mechanism, "mechanism", "J", v);
-    v.l = parameter;
-    setField(env, mechanism, "pParameter", "Ljava/lang/Object;", v);
+    setField(env, mechanism, "mechanism", "J", jv(static_cast<jlong>(type)));
+    setField(env, mechanism, "pParameter", "Ljava/lang/Object;", jv(parameter));
     return mechanism;
 }
 
@@ -168,7 +182,7 @@ protected:
     // mechanism; the buffers that rule leaves are checked and released.
     void convertCheckAndFree(const ParameterRow& row, CK_MECHANISM_TYPE mechanism,
                              const std::vector<std::size_t>& leftAllocated) {
-        std::string where = std::string(row.className) + " freed as 0x" + hex(mechanism);
+        std::string where = std::string(row.className) + " freed as " + std::to_string(mechanism);
         TrackedAllocations tracked;
         int seed = 0;
         jobject jParam = buildJava(env_, row.className, row.members, seed);
@@ -188,15 +202,11 @@ protected:
             tracked.release(buffer);
         }
     }
-    static std::string hex(CK_ULONG v) {
-        char text[20];
-        std::snprintf(text, sizeof text, "%llx", static_cast<unsigned long long>(v));
-        return text;
-    }
 };
 
 TEST_F(MechanismParams, EachClassMatchesItsPackedLayoutAndIsFreedByItsMechanism) {
-    for (const auto& row : parameterRows()) convertCheckAndFree(row, row.mechanism, row.leftAllocated);
+    for (const auto& row : parameterRows())
+        convertCheckAndFree(row, row.mechanism, row.leftAllocated);
 }
 
 TEST_F(MechanismParams, AClassIsFreedByTheMechanismTypesRuleNotByItsOwn) {
@@ -206,58 +216,52 @@ TEST_F(MechanismParams, AClassIsFreedByTheMechanismTypesRuleNotByItsOwn) {
         std::vector<std::size_t> leftAllocated;
     } cases[] = {
         // No rule for plain RSA: the OAEP source data stays.
-        {"CK_RSA_PKCS_OAEP_PARAMS", CKM_RSA_PKCS,
-         {offsetof(CK_RSA_PKCS_OAEP_PARAMS, pSourceData)}},
+        {"CK_RSA_PKCS_OAEP_PARAMS", CKM_RSA_PKCS, {offsetof(CK_RSA_PKCS_OAEP_PARAMS, pSourceData)}},
         // The DH2 rule's third buffer lies past this smaller structure: not read.
         {"CK_ECDH1_DERIVE_PARAMS", CKM_ECMQV_DERIVE, {}},
         {"CK_X9_42_DH1_DERIVE_PARAMS", CKM_ECDH1_DERIVE, {}},
         // Same layout as the ECB string data, but the CBC rule keeps pData.
-        {"CK_KEY_DERIVATION_STRING_DATA", CKM_AES_CBC_ENCRYPT_DATA,
+        {"CK_KEY_DERIVATION_STRING_DATA",
+         CKM_AES_CBC_ENCRYPT_DATA,
          {offsetof(CK_KEY_DERIVATION_STRING_DATA, pData)}},
     };
-    for (const auto& c : cases) convertCheckAndFree(rowOf(c.className), c.mechanism, c.leftAllocated);
+    for (const auto& c : cases)
+        convertCheckAndFree(rowOf(c.className), c.mechanism, c.leftAllocated);
 }
 
 TEST_F(MechanismParams, PlainParametersAndTheirLengths) {
     voktest::LogCapture log;
-    auto boxed = [&](const char* cls, const char* sig, jlong v) {
-        jvalue x;
-        if (sig[1] == 'Z') x.z = static_cast<jboolean>(v); else x.j = v;
-        return newBoxed(env_, cls, sig, x);
-    };
-    jobject version = newObject(env_, "CK_VERSION");
-    jvalue major, minor;
-    major.b = 2;
-    minor.b = 40;
-    setField(env_, version, "major", "B", major);
-    setField(env_, version, "minor", "B", minor);
+    int seed = 0;  // major 0x80, minor 0x81
+    jobject version = buildJava(env_, "CK_VERSION",
+                                {VOK_BYTE(CK_VERSION, major), VOK_BYTE(CK_VERSION, minor)}, seed);
     uint64_t longValue = 0x1122334455667788;
     struct {
         const char* what;
         jobject parameter;
         Bytes expected;  // empty: null parameter
-        const char* exception;
+        const char* exception = nullptr;
     } cases[] = {
-        {"none", nullptr, {}, nullptr},
-        {"byte[] as is", newBytes(env_, {9, 8, 7}), {9, 8, 7}, nullptr},
-        {"Long", boxed("java/lang/Long", "(J)V", 0x1122334455667788), nativeBytes(&longValue, 8),
-         nullptr},
-        {"CK_VERSION", version, {2, 40}, nullptr},
-        {"Boolean through the value converter", boxed("java/lang/Boolean", "(Z)V", 1), {1},
-         nullptr},
+        // clang-format off
+        {"none", nullptr, {}},
+        {"byte[] as is", newBytes(env_, {9, 8, 7}), {9, 8, 7}},
+        {"Long", newBoxed(env_, "java/lang/Long", "(J)V", jv(jlong(longValue))),
+         nativeBytes(&longValue, 8)},
+        {"CK_VERSION", version, {0x80, 0x81}},
+        {"Boolean, as any value", newBoxed(env_, "java/lang/Boolean", "(Z)V", jv(jboolean(1))),
+         {1}},
         {"unknown class", newObject(env_, "java/lang/Object"), {},
          "com.vok.smartcard.pkcs11.PKCS11RuntimeException"},
+        // clang-format on
     };
     for (const auto& c : cases) {
         TrackedAllocations tracked;
-        CK_MECHANISM ck = jMechanismToCKMechanism(env_, newMechanism(env_, CKM_AES_CBC, c.parameter));
+        CK_MECHANISM ck =
+            jMechanismToCKMechanism(env_, newMechanism(env_, CKM_AES_CBC, c.parameter));
         EXPECT_EQ(takePendingException(env_).className, c.exception ? c.exception : "") << c.what;
         EXPECT_EQ(ck.mechanism, CKM_AES_CBC);
         EXPECT_EQ(ck.ulParameterLen, c.expected.size()) << c.what;
         EXPECT_EQ(nativeBytes(ck.pParameter, c.expected.size()), c.expected) << c.what;
-        if (c.expected.empty()) {
-            EXPECT_EQ(ck.pParameter, nullptr) << c.what;
-        }
+        EXPECT_TRUE(!c.expected.empty() || ck.pParameter == nullptr) << c.what;
         freeCKMechanismParameter(&ck);
         EXPECT_EQ(tracked.live(), 0u) << c.what;
     }
@@ -273,11 +277,10 @@ TEST_F(MechanismParams, CbcEncryptDataIvIsCutToTheMember) {
         TrackedAllocations tracked;
         Bytes iv(ivLength);
         for (int i = 0; i < ivLength; ++i) iv[i] = static_cast<uint8_t>(0xA0 + i);
-        for (const char* cls : {"CK_DES_CBC_ENCRYPT_DATA_PARAMS", "CK_AES_CBC_ENCRYPT_DATA_PARAMS"}) {
+        for (const char* cls :
+             {"CK_DES_CBC_ENCRYPT_DATA_PARAMS", "CK_AES_CBC_ENCRYPT_DATA_PARAMS"}) {
             jobject jParam = newObject(env_, cls);
-            jvalue v;
-            v.l = newBytes(env_, iv);
-            setField(env_, jParam, "iv", "[B", v);
+            setField(env_, jParam, "iv", "[B", jv(newBytes(env_, iv)));
             void* native = nullptr;
             CK_ULONG length = 0;
             jMechanismParameterToCKMechanismParameter(env_, jParam, &native, &length);
@@ -296,9 +299,7 @@ TEST_F(MechanismParams, CbcEncryptDataIvIsCutToTheMember) {
 TEST_F(MechanismParams, KeyMaterialThatCannotBeAllocatedLeavesTheRest) {
     TrackedAllocations tracked;
     jobject jParam = newObject(env_, "CK_SSL3_KEY_MAT_PARAMS");
-    jvalue v;
-    v.j = 128;
-    setField(env_, jParam, "ulKeySizeInBits", "J", v);
+    setField(env_, jParam, "ulKeySizeInBits", "J", jv(jlong(128)));
     tracked.failAllocation(2);  // the structure, then the key material
     void* native = nullptr;
     CK_ULONG length = 0;
@@ -320,122 +321,66 @@ TEST_F(MechanismParams, KeyMaterialThatCannotBeAllocatedLeavesTheRest) {
 
 // ---- Copy-backs ---------------------------------------------------------------
 
-struct CopyBack {
-    const char* what;
-    void (*copyBack)(JNIEnv*, CK_MECHANISM_PTR, jobject);
-    CK_MECHANISM_TYPE mechanism;
-    const char* className;
-    std::vector<Member> members;
-    // Plays the module: writes results into the native parameter.
-    std::function<void(void* native)> module;
-    // Checks the Java parameter; copied says whether results must be there.
-    std::function<void(JNIEnv*, jobject jParam, bool copied, const std::string& where)> check;
-};
-
-jobject fieldOf(JNIEnv* env, jobject object, const char* name, const char* signature) {
-    return getField(env, object, name, signature).l;
-}
-
-const std::vector<CopyBack>& copyBacks() {
-    static const std::vector<CopyBack> rows = {
-        {"PBE initialization vector", copyBackPBEInitializationVector, CKM_PBE_SHA1_CAST5_CBC,
-         "CK_PBE_PARAMS", {{Kind::Chars, "pInitVector", 0}, {Kind::Chars, "pInitVektor", 0}},
-         [](void* native) {
-             auto* p = static_cast<CK_PBE_PARAMS*>(native);
-             for (int i = 0; i < 2; ++i) p->pInitVector[i] = static_cast<CK_BYTE>(0xF0 + i);
-         },
-         [](JNIEnv* env, jobject jParam, bool copied, const std::string& where) {
-             // Both arrays were made from the same seeds' values; the IV
-             // lands in pInitVektor only, widened without sign.
-             std::u16string sent = charsOf(env, fieldOf(env, jParam, "pInitVector", "[C"));
-             std::u16string back = charsOf(env, fieldOf(env, jParam, "pInitVektor", "[C"));
-             EXPECT_EQ(sent.substr(0, 2), u"\u2a00\u2a01") << where;
-             EXPECT_EQ(back.substr(0, 2), copied ? u"\u00f0\u00f1" : u"\u2a10\u2a11") << where;
-         }},
-        {"SET OAEP unwrapped key", copyBackSetUnwrappedKey, CKM_KEY_WRAP_SET_OAEP,
-         "CK_KEY_WRAP_SET_OAEP_PARAMS",
-         {VOK_BYTE(CK_KEY_WRAP_SET_OAEP_PARAMS, bBC),
-          VOK_BYTES(CK_KEY_WRAP_SET_OAEP_PARAMS, pX, ulXLen)},
-         [](void* native) {
-             auto* p = static_cast<CK_KEY_WRAP_SET_OAEP_PARAMS*>(native);
-             p->bBC = 0x7E;
-             for (CK_ULONG i = 0; i < p->ulXLen; ++i) p->pX[i] = static_cast<CK_BYTE>(0x50 + i);
-         },
-         [](JNIEnv* env, jobject jParam, bool copied, const std::string& where) {
-             EXPECT_EQ(getField(env, jParam, "bBC", "B").b, copied ? 0x7E : jbyte(0x80)) << where;
-             Bytes x = bytesOf(env, fieldOf(env, jParam, "pX", "[B"));
-             EXPECT_EQ(x, copied ? Bytes({0x50, 0x51, 0x52}) : Bytes({0x10, 0x11, 0x12})) << where;
-         }},
-        {"SSL3 client version", copyBackClientVersion, CKM_SSL3_MASTER_KEY_DERIVE,
-         "CK_SSL3_MASTER_KEY_DERIVE_PARAMS",
-         {{Kind::Pointed, "pVersion", 0, kNoLength, 0, "CK_VERSION",
-           {VOK_BYTE(CK_VERSION, major), VOK_BYTE(CK_VERSION, minor)}}},
-         [](void* native) {
-             auto* p = static_cast<CK_SSL3_MASTER_KEY_DERIVE_PARAMS*>(native);
-             p->pVersion->major = 3;
-             p->pVersion->minor = 1;
-         },
-         [](JNIEnv* env, jobject jParam, bool copied, const std::string& where) {
-             jobject version = fieldOf(env, jParam, "pVersion", "Lcom/vok/smartcard/pkcs11/CK_VERSION;");
-             EXPECT_EQ(getField(env, version, "major", "B").b, copied ? 3 : jbyte(0x81)) << where;
-             EXPECT_EQ(getField(env, version, "minor", "B").b, copied ? 1 : jbyte(0x82)) << where;
-         }},
-        {"SSL3 key material", copyBackSSLKeyMatParams, CKM_SSL3_KEY_AND_MAC_DERIVE,
-         "CK_SSL3_KEY_MAT_PARAMS",
-         {{Kind::Pointed, "pReturnedKeyMaterial", 0, kNoLength, 0, "CK_SSL3_KEY_MAT_OUT",
-           {VOK_BYTES_ONLY(CK_SSL3_KEY_MAT_OUT, pIVClient),
-            VOK_BYTES_ONLY(CK_SSL3_KEY_MAT_OUT, pIVServer)}}},
-         [](void* native) {
-             CK_SSL3_KEY_MAT_OUT* out = static_cast<CK_SSL3_KEY_MAT_PARAMS*>(native)->pReturnedKeyMaterial;
-             out->hClientMacSecret = 11, out->hServerMacSecret = 12;
-             out->hClientKey = 13, out->hServerKey = 14;
-             out->pIVClient[0] = 0xC1, out->pIVServer[0] = 0x5E;
-         },
-         [](JNIEnv* env, jobject jParam, bool copied, const std::string& where) {
-             jobject out = fieldOf(env, jParam, "pReturnedKeyMaterial",
-                                   "Lcom/vok/smartcard/pkcs11/CK_SSL3_KEY_MAT_OUT;");
-             const char* handles[] = {"hClientMacSecret", "hServerMacSecret", "hClientKey", "hServerKey"};
-             for (int i = 0; i < 4; ++i) {
-                 EXPECT_EQ(getField(env, out, handles[i], "J").j, copied ? 11 + i : 0) << where;
-             }
-             EXPECT_EQ(bytesOf(env, fieldOf(env, out, "pIVClient", "[B"))[0], copied ? 0xC1 : 0x10)
-                 << where;
-             EXPECT_EQ(bytesOf(env, fieldOf(env, out, "pIVServer", "[B"))[0], copied ? 0x5E : 0x20)
-                 << where;
-         }},
-    };
-    return rows;
-}
-
 TEST_F(MechanismParams, CopyBacksActOnlyWhenTheJavaMechanismMatches) {
-    for (const auto& row : copyBacks()) {
-        // The TLS variant of the key derivations gets nothing back, even matching.
-        CK_MECHANISM_TYPE tls = row.mechanism == CKM_SSL3_MASTER_KEY_DERIVE     ? CKM_TLS_MASTER_KEY_DERIVE
-                                : row.mechanism == CKM_SSL3_KEY_AND_MAC_DERIVE ? CKM_TLS_KEY_AND_MAC_DERIVE
-                                                                               : row.mechanism;
+    using PBE = CK_PBE_PARAMS;
+    using SET = CK_KEY_WRAP_SET_OAEP_PARAMS;
+    // The module's results are the Java values inverted; each copy-back
+    // brings back every member listed (PBE: see below).
+    struct {
+        void (*copyBack)(JNIEnv*, CK_MECHANISM_PTR, jobject);
+        CK_MECHANISM_TYPE mechanism, tls;  // tls: its variant that gets nothing back
+        const char* className;
+        std::vector<Member> members;
+    } rows[] = {
+        // clang-format off
+        {copyBackPBEInitializationVector, CKM_PBE_SHA1_CAST5_CBC, CKM_PBE_SHA1_CAST5_CBC,
+         "CK_PBE_PARAMS", {VOK_CHARS_ONLY(PBE, pInitVector), {Kind::Chars, "pInitVektor", 0}}},
+        {copyBackSetUnwrappedKey, CKM_KEY_WRAP_SET_OAEP, CKM_KEY_WRAP_SET_OAEP,
+         "CK_KEY_WRAP_SET_OAEP_PARAMS", {VOK_BYTE(SET, bBC), VOK_BYTES(SET, pX, ulXLen)}},
+        {copyBackClientVersion, CKM_SSL3_MASTER_KEY_DERIVE, CKM_TLS_MASTER_KEY_DERIVE,
+         "CK_SSL3_MASTER_KEY_DERIVE_PARAMS", {kVersionPointer}},
+        {copyBackSSLKeyMatParams, CKM_SSL3_KEY_AND_MAC_DERIVE, CKM_TLS_KEY_AND_MAC_DERIVE,
+         "CK_SSL3_KEY_MAT_PARAMS", {kKeyMaterialPointer}},
+        // clang-format on
+    };
+    for (const auto& row : rows) {
         struct {
             const char* how;
             CK_MECHANISM_TYPE native, java;
             bool copied;
         } variants[] = {{"matching", row.mechanism, row.mechanism, true},
                         {"not matching", row.mechanism, row.mechanism + 1, false},
-                        {"TLS", tls, tls, tls == row.mechanism}};
+                        {"TLS", row.tls, row.tls, row.tls == row.mechanism}};
         for (const auto& v : variants) {
-            std::string where = std::string(row.what) + ", " + v.how;
+            std::string where = std::string(row.className) + ", " + v.how;
             TrackedAllocations tracked;
             int seed = 0;
             jobject jParam = buildJava(env_, row.className, row.members, seed);
             CK_MECHANISM ck = jMechanismToCKMechanism(env_, newMechanism(env_, v.native, jParam));
             ASSERT_FALSE(env_->ExceptionCheck()) << where;
-            row.module(ck.pParameter);
+            bool pbe = row.copyBack == copyBackPBEInitializationVector;
+            seed = 0;
+            invertNative(ck.pParameter, pbe ? std::vector<Member>{row.members[0]} : row.members,
+                         seed);
             row.copyBack(env_, &ck, newMechanism(env_, v.java, jParam));
             EXPECT_FALSE(env_->ExceptionCheck()) << where;
-            row.check(env_, jParam, v.copied, where);
-            void* keyMaterial = row.mechanism == CKM_SSL3_KEY_AND_MAC_DERIVE
-                                    ? static_cast<CK_SSL3_KEY_MAT_PARAMS*>(ck.pParameter)->pReturnedKeyMaterial
-                                    : nullptr;
+            seed = 0;
+            if (!pbe) {
+                checkJavaValues(env_, jParam, row.members, seed, v.copied, where);
+            } else {
+                // The IV goes out in pInitVector and comes back in pInitVektor,
+                // as far as the shorter of the two reaches, widened without sign.
+                jobject back = getField(env_, jParam, "pInitVektor", "[C").l;
+                EXPECT_EQ(charsOf(env_, back),
+                          v.copied ? u"\u00ff\u00fe\u2a12" : u"\u2a10\u2a11\u2a12")
+                    << where;
+                checkJavaValues(env_, jParam, {row.members[0]}, seed, false, where);
+            }
+            void* keyMaterialLeft = row.mechanism == CKM_SSL3_KEY_AND_MAC_DERIVE
+                                        ? pointerAt(ck.pParameter, kKeyMaterialPointer.offset)
+                                        : nullptr;
             freeCKMechanismParameter(&ck);
-            tracked.release(keyMaterial);
+            tracked.release(keyMaterialLeft);
         }
     }
 }
