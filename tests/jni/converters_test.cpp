@@ -62,20 +62,21 @@ jobjectArray attributes(JNIEnv* env, std::initializer_list<jobject> elements) {
     return array;
 }
 
-#define ARRAY(Type, ...) \
-    array(&JNIEnv::New##Type##Array, &JNIEnv::Set##Type##ArrayRegion, __VA_ARGS__)
+// New Java arrays of the given elements.
+#define ARRAY_OF(name, Type, T)                                                                   \
+    jobject name(JNIEnv* env, std::initializer_list<T> values) {                                  \
+        auto array = env->New##Type##Array(static_cast<jsize>(values.size()));                    \
+        env->Set##Type##ArrayRegion(array, 0, static_cast<jsize>(values.size()), values.begin()); \
+        return array;                                                                             \
+    }
+ARRAY_OF(booleans, Boolean, jboolean)
+ARRAY_OF(ints, Int, jint)
+ARRAY_OF(longs, Long, jlong)
 
 class Converters : public voktest::JvmTest {
 protected:
     jobject box(const char* simpleName, const char* signature, jvalue v) {
         return newBoxed(env_, (std::string("java/lang/") + simpleName).c_str(), signature, v);
-    }
-    template <typename Array, typename T>
-    Array array(Array (JNIEnv::*make)(jsize), void (JNIEnv::*set)(Array, jsize, jsize, const T*),
-                std::vector<T> values) {
-        Array a = (env_->*make)(static_cast<jsize>(values.size()));
-        (env_->*set)(a, 0, static_cast<jsize>(values.size()), values.data());
-        return a;
     }
 };
 
@@ -105,12 +106,12 @@ TEST_F(Converters, EachValueClassTakesItsRowInOrder) {
          "java.lang.NoClassDefFoundError: java/lang/Char"},
         {"Integer", box("Integer", "(I)V", jv(jint(-2))), le64(0xFFFFFFFFFFFFFFFEull), 8},
         // Only exactly 1 is true.
-        {"boolean[]", ARRAY(Boolean, {1, 0, 2}), {1, 0, 0}, 3},
+        {"boolean[]", booleans(env_, {1, 0, 2}), {1, 0, 0}, 3},
         // Length in elements, each element read as 64 bits.
-        {"int[]", ARRAY(Int, {1, 2, 3}),
+        {"int[]", ints(env_, {1, 2, 3}),
          le64(0x0000000200000001) + le64(3) + le64(0), 3},
         // Length in bytes.
-        {"long[]", ARRAY(Long, {5, -1}), le64(5) + le64(~0ull), 16},
+        {"long[]", longs(env_, {5, -1}), le64(5) + le64(~0ull), 16},
         {"String", env_->NewStringUTF("a\xc3\xa9"), {'a', 0xC3, 0xA9, 0}, 3},
         {"Double", box("Double", "(D)V", jv(jdouble(1.5))), {}, 0,
          "com.vok.smartcard.pkcs11.PKCS11RuntimeException: Java object of this class cannot be "
