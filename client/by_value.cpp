@@ -110,7 +110,8 @@ bool holdsTemplate(const CK_ATTRIBUTE& mine) {
     return mine.pValue && layout::isTemplateAttribute(mine.type);
 }
 
-bool copyBackTemplateValue(const pkcs11::CK_ATTRIBUTE& answer, CK_ATTRIBUTE& mine, int depth) {
+bool copyBackTemplateValue(const pkcs11::CK_ATTRIBUTE& answer, CK_ATTRIBUTE& mine, int depth,
+                           CK_RV& result) {
     if (!layout::isTemplateAttribute(mine.type) || answer.type() != mine.type) return false;
     if (!answer.has_pvaluetemplate()) return mine.pValue != nullptr;
     const pkcs11::CK_TEMPLATE& value = answer.pvaluetemplate();
@@ -118,11 +119,17 @@ bool copyBackTemplateValue(const pkcs11::CK_ATTRIBUTE& answer, CK_ATTRIBUTE& min
         mine.ulValueLen = value.ulcount() * sizeof(CK_ATTRIBUTE);  // a length query
         return true;
     }
+    // More entries than the caller's array holds: nothing is copied, as for a
+    // value larger than its buffer.
     const CK_ULONG room = mine.ulValueLen / sizeof(CK_ATTRIBUTE);
-    if (depth < layout::kMaxTemplateDepth)
-        copyBackTemplate(value.attribute(), value.ulcount(),
-                         static_cast<CK_ATTRIBUTE*>(mine.pValue), room, depth + 1);
-    mine.ulValueLen = std::min<CK_ULONG>(value.ulcount(), room) * sizeof(CK_ATTRIBUTE);
+    if (value.ulcount() > room || depth >= layout::kMaxTemplateDepth) {
+        mine.ulValueLen = CK_UNAVAILABLE_INFORMATION;
+        if (result == CKR_OK) result = CKR_BUFFER_TOO_SMALL;
+        return true;
+    }
+    result = copyBackTemplate(result, value.attribute(), value.ulcount(),
+                              static_cast<CK_ATTRIBUTE*>(mine.pValue), room, depth + 1);
+    mine.ulValueLen = value.ulcount() * sizeof(CK_ATTRIBUTE);
     return true;
 }
 

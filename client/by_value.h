@@ -28,10 +28,13 @@ void putTemplateValue(pkcs11::CK_ATTRIBUTE* out, const CK_ATTRIBUTE& attribute, 
 
 // Copy-back into a caller's attribute whose value is a template: the entries
 // of the answer's by-value form into the caller's nested array, and its
-// length in this process's units. Raw bytes never land in such an array (they
-// would replace the caller's pointers). False when the plain rule applies: the
-// attribute is no template, or a length query answered without entries.
-bool copyBackTemplateValue(const pkcs11::CK_ATTRIBUTE& answer, CK_ATTRIBUTE& mine, int depth);
+// length in this process's units, under the template copy-back's rules
+// (`result` is the caller's CK_RV so far). Raw bytes never land in such an
+// array (they would replace the caller's pointers). False when the plain rule
+// applies: the attribute is no template, or a length query answered without
+// entries.
+bool copyBackTemplateValue(const pkcs11::CK_ATTRIBUTE& answer, CK_ATTRIBUTE& mine, int depth,
+                           CK_RV& result);
 
 // A caller's value that is a template: only its by-value form writes into it.
 bool holdsTemplate(const CK_ATTRIBUTE& mine);

@@ -19,9 +19,9 @@ namespace client {
 constexpr CK_RV kChannelFailure = ~static_cast<CK_RV>(0);
 
 // Sends `request` and parses the answer into `response` (the parse result is
-// not checked: what was not read stays at its default, a missing `result`
-// reads as CKR_OK). Returns the channel status; on non-zero status `response`
-// is untouched. `responseLength` receives the length of the answer.
+// not checked: what was not read stays at its default). Returns the channel
+// status; on non-zero status `response` is untouched. `responseLength`
+// receives the length of the answer.
 int32_t exchange(const pkcs11::Operation& request, pkcs11::OperationResult& response,
                  uint32_t& responseLength);
 
@@ -51,6 +51,9 @@ CK_RV callService(const char* name, Fill&& fill, OnSuccess&& onSuccess, CopyBack
         uint32_t responseLength = 0;
         if (exchange(request, response, responseLength) != 0) return kChannelFailure;
         onSuccess(responseLength);
+        // No result is no answer (an empty or cut-off frame): read as CKR_OK it
+        // would let a C_Login or a C_Verify "succeed".
+        if (!response.has_result()) return kChannelFailure;
         if constexpr (std::is_void_v<decltype(copyBack(response))>) {
             copyBack(response);
             return response.result();

@@ -15,7 +15,7 @@ CK_RV C_EncryptInit(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism,
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_encinit();
             m->set_hsession(hSession);
-            putMechanism(m->mutable_mechanism(), pMechanism);
+            if (pMechanism) putMechanism(m->mutable_mechanism(), pMechanism);
             m->set_hkey(hKey);
         },
         noCopyBack);
@@ -28,7 +28,7 @@ CK_RV C_DecryptInit(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism,
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_decint();
             m->set_hsession(hSession);
-            putMechanism(m->mutable_mechanism(), pMechanism);
+            if (pMechanism) putMechanism(m->mutable_mechanism(), pMechanism);
             m->set_hkey(hKey);
         },
         noCopyBack);
@@ -40,7 +40,7 @@ CK_RV C_DigestInit(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism) {
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_digestint();
             m->set_hsession(hSession);
-            putMechanism(m->mutable_mechanism(), pMechanism);
+            if (pMechanism) putMechanism(m->mutable_mechanism(), pMechanism);
         },
         noCopyBack);
 }
@@ -52,7 +52,7 @@ CK_RV C_SignInit(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism, CK_OBJ
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_signinit();
             m->set_hsession(hSession);
-            putMechanism(m->mutable_mechanism(), pMechanism);
+            if (pMechanism) putMechanism(m->mutable_mechanism(), pMechanism);
             m->set_hkey(hKey);
             VOK_LOGD("C_SignInit before serialize");
         },
@@ -65,7 +65,7 @@ CK_RV C_VerifyInit(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism, CK_O
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_verifyinit();
             m->set_hsession(hSession);
-            putMechanism(m->mutable_mechanism(), pMechanism);
+            if (pMechanism) putMechanism(m->mutable_mechanism(), pMechanism);
             m->set_hkey(hKey);
         },
         noCopyBack);
@@ -79,7 +79,7 @@ CK_RV C_SignRecoverInit(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism,
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_signrecoverinit();
             m->set_hsession(hSession);
-            putMechanism(m->mutable_pmechanism(), pMechanism);
+            if (pMechanism) putMechanism(m->mutable_pmechanism(), pMechanism);
             m->set_hkey(hKey);
         },
         noCopyBack);
@@ -92,7 +92,7 @@ CK_RV C_VerifyRecoverInit(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanis
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_verifyrecoverinit();
             m->set_hsession(hSession);
-            putMechanism(m->mutable_pmechanism(), pMechanism);
+            if (pMechanism) putMechanism(m->mutable_pmechanism(), pMechanism);
             m->set_hkey(hKey);
         },
         noCopyBack);
@@ -106,7 +106,7 @@ CK_RV C_Encrypt(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pData, CK_ULONG ulDataLe
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_enc();
             m->set_hsession(hSession);
-            m->set_pdata(bytesOf(pData, ulDataLen));
+            if (const InputBuffer in{pData, ulDataLen}; in.present()) m->set_pdata(in.contents());
             m->set_uldatalen(ulDataLen);
             if (out.present()) m->set_pencrypteddata(out.contents());
             m->set_pulencrypteddatalen(out.capacity());
@@ -127,7 +127,7 @@ CK_RV C_EncryptUpdate(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pPart, CK_ULONG ul
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_encryptupdate();
             m->set_hsession(hSession);
-            m->set_ppart(bytesOf(pPart, ulPartLen));
+            if (const InputBuffer in{pPart, ulPartLen}; in.present()) m->set_ppart(in.contents());
             m->set_ulpartlen(ulPartLen);
             if (out.present()) m->set_pencryptedpart(out.contents());
             m->set_pulencryptedpartlen(out.capacity());
@@ -167,7 +167,8 @@ CK_RV C_Decrypt(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pEncryptedData, CK_ULONG
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_dec();
             m->set_hsession(hSession);
-            m->set_pencrypteddata(bytesOf(pEncryptedData, ulEncryptedDataLen));
+            if (const InputBuffer in{pEncryptedData, ulEncryptedDataLen}; in.present())
+                m->set_pencrypteddata(in.contents());
             m->set_ulencrypteddatalen(ulEncryptedDataLen);
             if (out.present()) m->set_pdata(out.contents());
             m->set_puldatalen(out.capacity());
@@ -188,7 +189,8 @@ CK_RV C_DecryptUpdate(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pEncryptedPart,
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_decryptupdate();
             m->set_hsession(hSession);
-            m->set_pencryptedpart(bytesOf(pEncryptedPart, ulEncryptedPartLen));
+            if (const InputBuffer in{pEncryptedPart, ulEncryptedPartLen}; in.present())
+                m->set_pencryptedpart(in.contents());
             m->set_ulencryptedpartlen(ulEncryptedPartLen);
             if (out.present()) m->set_ppart(out.contents());
             m->set_pulpartlen(out.capacity());
@@ -227,7 +229,7 @@ CK_RV C_Digest(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pData, CK_ULONG ulDataLen
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_digest();
             m->set_hsession(hSession);
-            m->set_pdata(bytesOf(pData, ulDataLen));
+            if (const InputBuffer in{pData, ulDataLen}; in.present()) m->set_pdata(in.contents());
             m->set_uldatalen(ulDataLen);
             if (out.present()) m->set_pdigest(out.contents());
             m->set_puldigestlen(out.capacity());
@@ -265,7 +267,7 @@ CK_RV C_Sign(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pData, CK_ULONG ulDataLen,
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_sign();
             m->set_hsession(hSession);
-            m->set_pdata(bytesOf(pData, ulDataLen));
+            if (const InputBuffer in{pData, ulDataLen}; in.present()) m->set_pdata(in.contents());
             m->set_uldatalen(ulDataLen);
             if (out.present()) m->set_psignature(out.contents());
             m->set_pulsignaturelen(out.capacity());
@@ -305,7 +307,7 @@ CK_RV C_SignRecover(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pData, CK_ULONG ulDa
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_signrecover();
             m->set_hsession(hSession);
-            m->set_pdata(bytesOf(pData, ulDataLen));
+            if (const InputBuffer in{pData, ulDataLen}; in.present()) m->set_pdata(in.contents());
             m->set_uldatalen(ulDataLen);
             if (out.present()) m->set_psignature(out.contents());
             m->set_pulsignaturelen(out.capacity());
@@ -326,7 +328,8 @@ CK_RV C_VerifyRecover(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pSignature, CK_ULO
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_verifyrecover();
             m->set_hsession(hSession);
-            m->set_psignature(bytesOf(pSignature, ulSignatureLen));
+            if (const InputBuffer in{pSignature, ulSignatureLen}; in.present())
+                m->set_psignature(in.contents());
             m->set_ulsignaturelen(ulSignatureLen);
             if (out.present()) m->set_pdata(out.contents());
             m->set_puldatalen(out.capacity());
@@ -347,7 +350,7 @@ CK_RV C_DigestEncryptUpdate(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pPart, CK_UL
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_digestencryptupdate();
             m->set_hsession(hSession);
-            m->set_ppart(bytesOf(pPart, ulPartLen));
+            if (const InputBuffer in{pPart, ulPartLen}; in.present()) m->set_ppart(in.contents());
             m->set_ulpartlen(ulPartLen);
             if (out.present()) m->set_pencryptedpart(out.contents());
             m->set_pulencryptedpartlen(out.capacity());
@@ -369,7 +372,8 @@ CK_RV C_DecryptDigestUpdate(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pEncryptedPa
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_decryptdigestupdate();
             m->set_hsession(hSession);
-            m->set_pencryptedpart(bytesOf(pEncryptedPart, ulEncryptedPartLen));
+            if (const InputBuffer in{pEncryptedPart, ulEncryptedPartLen}; in.present())
+                m->set_pencryptedpart(in.contents());
             m->set_ulencryptedpartlen(ulEncryptedPartLen);
             if (out.present()) m->set_ppart(out.contents());
             m->set_pulpartlen(out.capacity());
@@ -390,7 +394,7 @@ CK_RV C_SignEncryptUpdate(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pPart, CK_ULON
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_signencryptupdate();
             m->set_hsession(hSession);
-            m->set_ppart(bytesOf(pPart, ulPartLen));
+            if (const InputBuffer in{pPart, ulPartLen}; in.present()) m->set_ppart(in.contents());
             m->set_ulpartlen(ulPartLen);
             if (out.present()) m->set_pencryptedpart(out.contents());
             m->set_pulencryptedpartlen(out.capacity());
@@ -412,7 +416,8 @@ CK_RV C_DecryptVerifyUpdate(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pEncryptedPa
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_decryptverifyupdate();
             m->set_hsession(hSession);
-            m->set_pencryptedpart(bytesOf(pEncryptedPart, ulEncryptedPartLen));
+            if (const InputBuffer in{pEncryptedPart, ulEncryptedPartLen}; in.present())
+                m->set_pencryptedpart(in.contents());
             m->set_ulencryptedpartlen(ulEncryptedPartLen);
             if (out.present()) m->set_ppart(out.contents());
             m->set_pulpartlen(out.capacity());
@@ -431,7 +436,7 @@ CK_RV C_DigestUpdate(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pPart, CK_ULONG ulP
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_digestupdate();
             m->set_hsession(hSession);
-            m->set_ppart(bytesOf(pPart, ulPartLen));
+            if (const InputBuffer in{pPart, ulPartLen}; in.present()) m->set_ppart(in.contents());
             m->set_ulpartlen(ulPartLen);
         },
         noCopyBack);
@@ -444,7 +449,7 @@ CK_RV C_SignUpdate(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pPart, CK_ULONG ulPar
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_signupdate();
             m->set_hsession(hSession);
-            m->set_ppart(bytesOf(pPart, ulPartLen));
+            if (const InputBuffer in{pPart, ulPartLen}; in.present()) m->set_ppart(in.contents());
             m->set_ulpartlen(ulPartLen);
         },
         noCopyBack);
@@ -457,7 +462,7 @@ CK_RV C_VerifyUpdate(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pPart, CK_ULONG ulP
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_verifyupdate();
             m->set_hsession(hSession);
-            m->set_ppart(bytesOf(pPart, ulPartLen));
+            if (const InputBuffer in{pPart, ulPartLen}; in.present()) m->set_ppart(in.contents());
             m->set_ulpartlen(ulPartLen);
         },
         noCopyBack);
@@ -470,7 +475,8 @@ CK_RV C_VerifyFinal(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pSignature, CK_ULONG
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_verifyfinal();
             m->set_hsession(hSession);
-            m->set_psignature(bytesOf(pSignature, ulSignatureLen));
+            if (const InputBuffer in{pSignature, ulSignatureLen}; in.present())
+                m->set_psignature(in.contents());
             m->set_ulsignaturelen(ulSignatureLen);
         },
         noCopyBack);
@@ -497,7 +503,7 @@ CK_RV C_Verify(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pData, CK_ULONG ulDataLen
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_verify();
             m->set_hsession(hSession);
-            m->set_pdata(bytesOf(pData, ulDataLen));
+            if (const InputBuffer in{pData, ulDataLen}; in.present()) m->set_pdata(in.contents());
             m->set_uldatalen(ulDataLen);
             if (pSignature) m->set_psignature(cString(pSignature, ulSignatureLen));
             m->set_ulsignaturelen(ulSignatureLen);

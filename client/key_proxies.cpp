@@ -36,7 +36,7 @@ CK_RV C_GenerateKey(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism,
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_generatekey();
             m->set_hsession(hSession);
-            putMechanism(m->mutable_pmechanism(), pMechanism);
+            if (pMechanism) putMechanism(m->mutable_pmechanism(), pMechanism);
             putTemplate(m->mutable_ptemplate(), pTemplate, ulCount);
             m->set_ulcount(ulCount);
         },
@@ -55,7 +55,7 @@ CK_RV C_GenerateKeyPair(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism,
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_generatekeypair();
             m->set_hsession(hSession);
-            putMechanism(m->mutable_pmechanism(), pMechanism);
+            if (pMechanism) putMechanism(m->mutable_pmechanism(), pMechanism);
             putTemplate(m->mutable_ppublickeytemplate(), pPublicKeyTemplate,
                         ulPublicKeyAttributeCount);
             m->set_ulpublickeyattributecount(ulPublicKeyAttributeCount);
@@ -80,7 +80,7 @@ CK_RV C_WrapKey(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism,
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_wrapkey();
             m->set_hsession(hSession);
-            putMechanism(m->mutable_pmechanism(), pMechanism);
+            if (pMechanism) putMechanism(m->mutable_pmechanism(), pMechanism);
             m->set_hwrappingkey(hWrappingKey);
             m->set_hkey(hKey);
             if (out.present()) m->set_pwrappedkey(out.contents());
@@ -105,9 +105,10 @@ CK_RV C_UnwrapKey(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism,
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_unwrapkey();
             m->set_hsession(hSession);
-            putMechanism(m->mutable_pmechanism(), pMechanism);
+            if (pMechanism) putMechanism(m->mutable_pmechanism(), pMechanism);
             m->set_hunwrappingkey(hUnwrappingKey);
-            m->set_pwrappedkey(bytesOf(pWrappedKey, ulWrappedKeyLen));
+            if (const InputBuffer in{pWrappedKey, ulWrappedKeyLen}; in.present())
+                m->set_pwrappedkey(in.contents());
             m->set_ulwrappedkeylen(ulWrappedKeyLen);
             putTemplate(m->mutable_ptemplate(), pTemplate, ulAttributeCount);
             m->set_ulattributecount(ulAttributeCount);
@@ -126,7 +127,7 @@ CK_RV C_DeriveKey(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism,
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_derivekey();
             m->set_hsession(hSession);
-            putMechanism(m->mutable_pmechanism(), pMechanism);
+            if (pMechanism) putMechanism(m->mutable_pmechanism(), pMechanism);
             m->set_hbasekey(hBaseKey);
             putTemplate(m->mutable_ptemplate(), pTemplate, ulAttributeCount);
             m->set_ulattributecount(ulAttributeCount);
@@ -163,11 +164,15 @@ CK_RV C_GenerateRandom(CK_SESSION_HANDLE hSession, CK_BYTE_PTR RandomData, CK_UL
             m->set_ulrandomlen(ulRandomLen);
         },
         [&](const pkcs11::OperationResult& res) {
-            if (!res.has_generaterandomres()) return;
+            if (!res.has_generaterandomres()) return static_cast<CK_RV>(res.result());
             const auto& r = res.generaterandomres();
-            copyIntoInput(r.randomdata().substr(0, static_cast<size_t>(std::min<CK_ULONG>(
-                                                       r.ulrandomlen(), r.randomdata().size()))),
-                          RandomData, ulRandomLen);
+            const size_t arrived =
+                static_cast<size_t>(std::min<CK_ULONG>(r.ulrandomlen(), r.randomdata().size()));
+            copyIntoInput(r.randomdata().substr(0, arrived), RandomData, ulRandomLen);
+            // Bytes the answer left unfilled are not random: no answer at all.
+            if (res.result() == CKR_OK && RandomData && arrived < ulRandomLen)
+                return kChannelFailure;
+            return static_cast<CK_RV>(res.result());
         });
 }
 

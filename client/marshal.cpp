@@ -50,24 +50,36 @@ void putTemplate(AttributeList* out, const CK_ATTRIBUTE* tmpl, CK_ULONG count) {
     }
 }
 
-void copyBackTemplate(const AttributeList& answer, CK_ULONG statedCount, CK_ATTRIBUTE* tmpl,
-                      CK_ULONG callerCount, int depth) {
-    if (!tmpl) return;
+Reported reportLength(CK_RV rv, CK_ULONG stated, size_t arrived, CK_ULONG capacity) {
+    const size_t copied = boundedCopy(stated, arrived, capacity);
+    if (rv != CKR_OK) return {rv, stated, copied};
+    if (stated > capacity) return {CKR_BUFFER_TOO_SMALL, stated, 0};
+    return {CKR_OK, copied, copied};
+}
+
+CK_RV copyBackTemplate(CK_RV rv, const AttributeList& answer, CK_ULONG statedCount,
+                       CK_ATTRIBUTE* tmpl, CK_ULONG callerCount, int depth) {
+    if (!tmpl) return rv;
     const CK_ULONG n =
         std::min<CK_ULONG>({statedCount, static_cast<CK_ULONG>(answer.size()), callerCount});
+    CK_RV result = rv;
     for (CK_ULONG i = 0; i < n; ++i) {
         const pkcs11::CK_ATTRIBUTE& a = answer.Get(static_cast<int>(i));
         CK_ATTRIBUTE& mine = tmpl[i];
-        if (copyBackTemplateValue(a, mine, depth)) continue;
+        if (copyBackTemplateValue(a, mine, depth, result)) continue;
         mine.type = a.type();
         if (!mine.pValue) {
             mine.ulValueLen = a.ulvaluelen();  // length query
+        } else if (a.ulvaluelen() > mine.ulValueLen && a.has_pvalue()) {
+            mine.ulValueLen = CK_UNAVAILABLE_INFORMATION;
+            if (rv == CKR_OK) result = CKR_BUFFER_TOO_SMALL;
         } else if (a.has_pvalue()) {
-            memcpy(mine.pValue, a.pvalue().data(),
-                   boundedCopy(a.ulvaluelen(), a.pvalue().size(), mine.ulValueLen));
-            mine.ulValueLen = a.ulvaluelen();
+            const size_t copied = boundedCopy(a.ulvaluelen(), a.pvalue().size(), mine.ulValueLen);
+            memcpy(mine.pValue, a.pvalue().data(), copied);
+            mine.ulValueLen = copied;
         }
     }
+    return result;
 }
 
 void overwriteTemplate(const AttributeList& answer, CK_ATTRIBUTE* tmpl, CK_ULONG callerCount) {
@@ -78,10 +90,13 @@ void overwriteTemplate(const AttributeList& answer, CK_ATTRIBUTE* tmpl, CK_ULONG
         CK_ATTRIBUTE& mine = tmpl[i];
         if (holdsTemplate(mine)) continue;
         mine.type = a.type();
-        if (mine.pValue)
-            memcpy(mine.pValue, a.pvalue().data(),
-                   boundedCopy(a.ulvaluelen(), a.pvalue().size(), mine.ulValueLen));
-        mine.ulValueLen = a.ulvaluelen();
+        if (!mine.pValue) {
+            mine.ulValueLen = a.ulvaluelen();
+            continue;
+        }
+        const size_t copied = boundedCopy(a.ulvaluelen(), a.pvalue().size(), mine.ulValueLen);
+        memcpy(mine.pValue, a.pvalue().data(), copied);
+        mine.ulValueLen = copied;
     }
 }
 
@@ -90,30 +105,37 @@ void putList(NumberList* out, const CK_ULONG* list, CK_ULONG count) {
     for (CK_ULONG i = 0; i < count; ++i) out->Add(list[i]);
 }
 
-void copyBackList(const NumberList& answer, CK_ULONG statedCount, CK_ULONG* list, CK_ULONG capacity,
-                  CK_ULONG* pulCount) {
-    if (pulCount) *pulCount = statedCount;
-    if (!list || answer.empty()) return;
-    const CK_ULONG n =
-        std::min<CK_ULONG>({statedCount, static_cast<CK_ULONG>(answer.size()), capacity});
-    for (CK_ULONG i = 0; i < n; ++i) list[i] = answer.Get(static_cast<int>(i));
+CK_RV copyBackList(CK_RV rv, const NumberList& answer, CK_ULONG statedCount, CK_ULONG* list,
+                   CK_ULONG capacity, CK_ULONG* pulCount) {
+    if (!list) {
+        if (pulCount) *pulCount = statedCount;
+        return rv;
+    }
+    const Reported r = reportLength(rv, statedCount, static_cast<size_t>(answer.size()), capacity);
+    for (size_t i = 0; i < r.copied; ++i) list[i] = answer.Get(static_cast<int>(i));
+    if (pulCount) *pulCount = r.length;
+    return r.rv;
 }
 
 void putMechanism(pkcs11::CK_MECHANISM* out, const CK_MECHANISM* mechanism) {
     if (!mechanism) return;
     out->set_mechanism(mechanism->mechanism);
-    out->set_pparameter(bytesOf(mechanism->pParameter, mechanism->ulParameterLen));
+    const InputBuffer parameter{mechanism->pParameter, mechanism->ulParameterLen};
+    if (parameter.present()) out->set_pparameter(parameter.contents());
     out->set_ulparameterlen(mechanism->ulParameterLen);
     putParameterValue(out, *mechanism);
 }
 
 CK_RV copyBackOutput(CK_RV rv, const std::string& data, CK_ULONG statedLength,
                      const OutputBuffer& out) {
-    if (out.buffer)
-        memcpy(out.buffer, data.data(), boundedCopy(statedLength, data.size(), out.capacity()));
-    if (out.length) *out.length = statedLength;
-    if (!out.buffer && rv == CKR_BUFFER_TOO_SMALL) return CKR_OK;
-    return rv;
+    if (!out.buffer) {
+        if (out.length) *out.length = statedLength;
+        return rv == CKR_BUFFER_TOO_SMALL ? CKR_OK : rv;
+    }
+    const Reported r = reportLength(rv, statedLength, data.size(), out.capacity());
+    memcpy(out.buffer, data.data(), r.copied);
+    if (out.length) *out.length = r.length;
+    return r.rv;
 }
 
 void copyIntoInput(const std::string& data, CK_BYTE* buffer, CK_ULONG length) {

@@ -3,9 +3,10 @@
 
 // The marshalling rules shared by the proxies. The service's answer is never
 // trusted further than what arrived, and the caller's buffers are never
-// written beyond the size the caller stated; the lengths and counts reported
-// back are still the ones the service stated, so a caller learns the size it
-// needs.
+// written beyond the size the caller stated. A length or count reported with
+// CKR_OK never exceeds what was written into the caller's buffer; one beyond
+// the buffer is reported as PKCS#11 reports it, CKR_BUFFER_TOO_SMALL with the
+// size needed.
 
 #include <cstddef>
 #include <string>
@@ -29,6 +30,27 @@ std::string cString(const void* p, CK_ULONG limit);
 // Input (pointer, length) pair: exactly `length` bytes.
 std::string bytesOf(const void* p, CK_ULONG length);
 
+// Input-buffer rule: exactly `length` bytes. A NULL pointer with a length
+// leaves the field absent, and the service hands the module NULL rather than
+// zeros; a NULL without a length is sent empty, as it always was.
+struct InputBuffer {
+    const void* data;
+    CK_ULONG length;
+    bool present() const { return data != nullptr || length == 0; }
+    std::string contents() const { return bytesOf(data, length); }
+};
+
+// What the caller learns of a length the service stated for its buffer.
+struct Reported {
+    CK_RV rv;
+    CK_ULONG length;
+    size_t copied;  // bytes (or entries) to copy into the buffer
+};
+// Under CKR_OK the length is what can be copied; a stated length beyond the
+// capacity is CKR_BUFFER_TOO_SMALL with that length and nothing copied. Any
+// other result keeps the stated length, with a bounded copy.
+Reported reportLength(CK_RV rv, CK_ULONG stated, size_t arrived, CK_ULONG capacity);
+
 // Template rule, for input templates and the output template of
 // C_GetAttributeValue alike. A value that is itself a template also travels
 // by value (by_value.h).
@@ -36,10 +58,13 @@ void putTemplate(AttributeList* out, const CK_ATTRIBUTE* tmpl, CK_ULONG count);
 
 // Template copy-back (C_GetAttributeValue, C_SetAttributeValue): types, value
 // bytes into non-NULL buffers that the answer filled, and the needed length
-// for NULL buffers. Templates inside values are copied back entry by entry,
-// `depth` counting the levels.
-void copyBackTemplate(const AttributeList& answer, CK_ULONG statedCount, CK_ATTRIBUTE* tmpl,
-                      CK_ULONG callerCount, int depth = 0);
+// for NULL buffers; a value's length is what was copied. A value larger than
+// its buffer leaves nothing but CK_UNAVAILABLE_INFORMATION behind, and turns
+// CKR_OK into CKR_BUFFER_TOO_SMALL, as a module reports it. Templates inside
+// values are copied back entry by entry, `depth` counting the levels. Returns
+// the caller's CK_RV.
+CK_RV copyBackTemplate(CK_RV rv, const AttributeList& answer, CK_ULONG statedCount,
+                       CK_ATTRIBUTE* tmpl, CK_ULONG callerCount, int depth = 0);
 
 // C_FindObjectsInit's copy-back: every returned attribute rewrites type, value
 // and length of the caller's entry, whether or not the answer carries a value;
@@ -48,9 +73,11 @@ void overwriteTemplate(const AttributeList& answer, CK_ATTRIBUTE* tmpl, CK_ULONG
 
 // List rule (C_GetSlotList, C_GetMechanismList).
 void putList(NumberList* out, const CK_ULONG* list, CK_ULONG count);
-// Writes the stated count to *pulCount and at most `capacity` entries.
-void copyBackList(const NumberList& answer, CK_ULONG statedCount, CK_ULONG* list, CK_ULONG capacity,
-                  CK_ULONG* pulCount);
+// Writes at most `capacity` entries and the count as reportLength gives it
+// (the stated count for a NULL list: the length query). Returns the caller's
+// CK_RV.
+CK_RV copyBackList(CK_RV rv, const NumberList& answer, CK_ULONG statedCount, CK_ULONG* list,
+                   CK_ULONG capacity, CK_ULONG* pulCount);
 
 // Mechanism rule: type and the parameter block as raw bytes; a parameter
 // that holds pointers also travels by value (by_value.h).
@@ -67,12 +94,11 @@ struct OutputBuffer {
     std::string contents() const { return cString(buffer, capacity()); }
 };
 
-// Output-buffer rule, answer side: at most the capacity and at most what
-// arrived is copied; *length takes the stated length. Returns the CK_RV the
-// caller sees: a length query that the module answered with
-// CKR_BUFFER_TOO_SMALL is what the caller asked for, so it becomes CKR_OK.
-// The service always hands the module a real buffer, so a query whose output
-// would be empty is executed rather than only measured.
+// Output-buffer rule, answer side: reportLength decides what is copied and
+// what *length takes. Returns the CK_RV the caller sees: a length query
+// answered with CKR_BUFFER_TOO_SMALL (by a service that hands the module an
+// empty buffer rather than NULL) is what the caller asked for, so it becomes
+// CKR_OK with the needed length.
 CK_RV copyBackOutput(CK_RV rv, const std::string& data, CK_ULONG statedLength,
                      const OutputBuffer& out);
 

@@ -102,9 +102,9 @@ CK_RV C_GetAttributeValue(CK_SESSION_HANDLE hSession, CK_OBJECT_HANDLE hObject,
             putTemplate(m->mutable_attribute(), pTemplate, ulCount);
         },
         [&](const pkcs11::OperationResult& res) {
-            if (!res.has_attvalueres()) return;
+            if (!res.has_attvalueres()) return static_cast<CK_RV>(res.result());
             const auto& r = res.attvalueres();
-            copyBackTemplate(r.attribute(), r.ulcount(), pTemplate, ulCount);
+            return copyBackTemplate(res.result(), r.attribute(), r.ulcount(), pTemplate, ulCount);
         });
 }
 
@@ -120,9 +120,9 @@ CK_RV C_SetAttributeValue(CK_SESSION_HANDLE hSession, CK_OBJECT_HANDLE hObject,
             m->set_ulcount(ulCount);
         },
         [&](const pkcs11::OperationResult& res) {
-            if (!res.has_setattributevalueres()) return;
+            if (!res.has_setattributevalueres()) return static_cast<CK_RV>(res.result());
             const auto& r = res.setattributevalueres();
-            copyBackTemplate(r.ptemplate(), r.ulcount(), pTemplate, ulCount);
+            return copyBackTemplate(res.result(), r.ptemplate(), r.ulcount(), pTemplate, ulCount);
         });
 }
 
@@ -156,11 +156,14 @@ CK_RV C_FindObjects(CK_SESSION_HANDLE hSession, CK_OBJECT_HANDLE_PTR phObject,
         [&](const pkcs11::OperationResult& res) {
             if (!res.has_findobjres()) return;
             const auto& r = res.findobjres();
-            if (pulObjectCount) *pulObjectCount = r.pulobjectcount();
-            if (r.pulobjectcount() == 0 || !phObject) return;
-            const CK_ULONG n = std::min<CK_ULONG>(
-                {r.pulobjectcount(), static_cast<CK_ULONG>(r.phobject_size()), ulMaxObjectCount});
+            // The count is the handles written, whatever the service stated.
+            CK_ULONG n = 0;
+            if (phObject)
+                n = std::min<CK_ULONG>({r.pulobjectcount(),
+                                        static_cast<CK_ULONG>(r.phobject_size()),
+                                        ulMaxObjectCount});
             for (CK_ULONG i = 0; i < n; ++i) phObject[i] = r.phobject(static_cast<int>(i));
+            if (pulObjectCount) *pulObjectCount = n;
         });
 }
 

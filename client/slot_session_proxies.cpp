@@ -34,10 +34,11 @@ CK_RV C_GetSlotList(CK_BBOOL tokenPresent, CK_SLOT_ID_PTR pSlotList, CK_ULONG_PT
             VOK_LOGD("serialize done and server called");
         },
         [&](const pkcs11::OperationResult& res) {
-            if (!res.has_slotlistres()) return;
+            if (!res.has_slotlistres()) return static_cast<CK_RV>(res.result());
             VOK_LOGD("Slot list res present");
             const auto& r = res.slotlistres();
-            copyBackList(r.slotidlist(), r.pulcount(), pSlotList, capacity, pulCount);
+            return copyBackList(res.result(), r.slotidlist(), r.pulcount(), pSlotList, capacity,
+                                pulCount);
         });
 }
 
@@ -57,10 +58,11 @@ CK_RV C_GetMechanismList(CK_SLOT_ID slotID, CK_MECHANISM_TYPE_PTR pMechanismList
             VOK_LOGD("serialize done and server called");
         },
         [&](const pkcs11::OperationResult& res) {
-            if (!res.has_mechanismlistres()) return;
+            if (!res.has_mechanismlistres()) return static_cast<CK_RV>(res.result());
             VOK_LOGD("Mechanism list res present");
             const auto& r = res.mechanismlistres();
-            copyBackList(r.pmechanismlist(), r.pulcount(), pMechanismList, capacity, pulCount);
+            return copyBackList(res.result(), r.pmechanismlist(), r.pulcount(), pMechanismList,
+                                capacity, pulCount);
         });
 }
 
@@ -263,7 +265,8 @@ CK_RV C_SetOperationState(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pOperationStat
         [&](pkcs11::Operation& op) {
             auto* m = op.mutable_setoperationstate();
             m->set_hsession(hSession);
-            m->set_poperationstate(bytesOf(pOperationState, ulOperationStateLen));
+            if (const InputBuffer in{pOperationState, ulOperationStateLen}; in.present())
+                m->set_poperationstate(in.contents());
             m->set_uloperationstatelen(ulOperationStateLen);
             m->set_hencryptionkey(hEncryptionKey);
             m->set_hauthenticationkey(hAuthenticationKey);

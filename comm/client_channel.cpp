@@ -10,6 +10,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <memory>
+#include <string>
 
 #define LOG_TAG "VOKPKCS11-COMM_CLIENT"
 #include "comm_internal.h"
@@ -22,8 +23,17 @@ constexpr time_t kReceiveTimeoutSeconds = 30;
 int socketFd = -1;
 // Read without the lock by every caller of execute_command.
 std::atomic<uint8_t> initialized{0};
-pthread_mutex_t clientLock;
+// One lock for the life of the process, taken by init, deinit and every
+// exchange, so that setting the channel up again never pulls the connection
+// (or the lock itself) from under an exchange in flight.
+pthread_mutex_t clientLock = PTHREAD_MUTEX_INITIALIZER;
 uint8_t drainBuffer[256];
+
+// Under clientLock. After a timeout or any failure that leaves the stream's
+// framing in doubt, a late answer may still come on this connection, after
+// any drain; the next exchange therefore connects again instead of reading it.
+bool connectionUsable = false;
+std::string connectedServerId;
 
 class ClientLockGuard {
 public:
@@ -87,7 +97,6 @@ int32_t checkVersion(int fd) {
 }
 
 int32_t connectAndCheckVersion(const char* serverId) {
-    pthread_mutex_init(&clientLock, nullptr);
     socketFd = socket(AF_UNIX, SOCK_STREAM, 0);
     if (socketFd == -1) {
         VOK_LOGD("Socket create failed");
@@ -113,13 +122,32 @@ int32_t connectAndCheckVersion(const char* serverId) {
         return CHANNEL_HANDSHAKE_FAILED;
     }
     VOK_LOGD("Exit - success");
-    initialized = 1;
-    VOK_LOGD("Exit - Init success");
+    connectionUsable = true;
+    connectedServerId = serverId != nullptr ? serverId : "";
     return CHANNEL_OK;
 }
 
-// Discards what an abandoned exchange left behind (say, a response that came
-// after its timeout) so the next header read lines up with a fresh response.
+int32_t reconnect() {
+    VOK_LOGD("Reconnect to server id %s", connectedServerId.c_str());
+    closeSocket();
+    const int32_t status = connectAndCheckVersion(connectedServerId.c_str());
+    if (status == CHANNEL_OK)
+        VOK_LOGD("Reconnected");
+    else
+        VOK_LOGD("Reconnect failed %d", status);
+    return status;
+}
+
+// Passes a failed exchange's status through, and gives up the connection
+// when what it left on the stream cannot be known.
+int32_t framingLost(int32_t status) {
+    connectionUsable = false;
+    return status;
+}
+
+// Discards bytes that no header announced (a misbehaving service's leftovers)
+// so the next header read lines up with a fresh response. An abandoned
+// exchange's late answer never comes here: its connection has been given up.
 void drainStaleBytes() {
     ssize_t n;
     while ((n = recv(socketFd, drainBuffer, sizeof(drainBuffer), MSG_DONTWAIT)) > 0)
@@ -128,17 +156,18 @@ void drainStaleBytes() {
 }
 
 int32_t receivePayload(int32_t dataLen, void** response, uint32_t* responseLength) {
-    // The peer decides the size: a negative length makes an impossible request
-    // and fails here like any other allocation failure.
-    MallocBuffer payload(std::malloc(static_cast<size_t>(dataLen)), &std::free);
+    // The peer decides the size: a negative length is an impossible request,
+    // failed like any other allocation failure (and never handed to malloc).
+    MallocBuffer payload(dataLen < 0 ? nullptr : std::malloc(static_cast<size_t>(dataLen)),
+                         &std::free);
     if (!payload) {
         VOK_LOGD("Malloc failed");
-        return CHANNEL_OUT_OF_MEMORY;
+        return framingLost(CHANNEL_OUT_OF_MEMORY);
     }
     int32_t status = client_recv_data(socketFd, payload.get(), dataLen);
     if (status != CHANNEL_OK) {
         VOK_LOGD("Client receive data failed %d", status);
-        return status;
+        return framingLost(status);
     }
     *response = payload.release();
     *responseLength = static_cast<uint32_t>(dataLen);
@@ -152,38 +181,47 @@ int32_t exchangeLocked(const void* request, int32_t length, void** response,
         VOK_LOGD("Invalid arguments");
         return CHANNEL_INVALID_ARGUMENTS;
     }
+    if (!connectionUsable) {
+        const int32_t status = reconnect();
+        if (status != CHANNEL_OK) return status;
+    }
     drainStaleBytes();
 
+    // From the first byte sent on, a failure leaves the stream in doubt: the
+    // service may hold half a request, or answer it later.
     FrameHeader header = {FRAME_ID_PKCS11, FRAME_TYPE_REQUEST, 0, length};
     int32_t status = client_send_data(socketFd, &header, sizeof(header));
     if (status != CHANNEL_OK) {
         VOK_LOGD("Client send header failed %d", status);
-        return status;
+        return framingLost(status);
     }
     status = client_send_data(socketFd, request, length);
     if (status != CHANNEL_OK) {
         VOK_LOGD("Client send data failed %d", status);
-        return status;
+        return framingLost(status);
     }
 
     header = FrameHeader{};
     status = client_recv_data(socketFd, &header, sizeof(header));
     if (status != CHANNEL_OK) {
         VOK_LOGD("Client receive header failed %d", status);
-        return status;
+        return framingLost(status);
     }
+    // A header whose payload is left unread leaves that payload on the stream.
+    const bool unreadPayload = header.data_len != 0;
     if (header.status != CHANNEL_OK) {
         // Reported as success without data; the caller then parses an empty
         // response.
         VOK_LOGD("Client receive header failed %d", CHANNEL_OK);
-        return CHANNEL_OK;
+        return unreadPayload ? framingLost(CHANNEL_OK) : CHANNEL_OK;
     }
     VOK_LOGD("Header data_len:%d", header.data_len);
     VOK_LOGD("Header id:%d, type:%d", header.id, header.type);
     if (header.data_len == 0 || header.id != FRAME_ID_PKCS11 ||
         header.type != FRAME_TYPE_RESPONSE) {
         VOK_LOGD("Client header error %d", CHANNEL_OK);
-        return CHANNEL_BAD_RESPONSE_HEADER;
+        return unreadPayload ? framingLost(CHANNEL_BAD_RESPONSE_HEADER)
+                             : CHANNEL_BAD_RESPONSE_HEADER;
     }
     return receivePayload(header.data_len, response, responseLength);
 }
@@ -224,11 +262,16 @@ int32_t client_recv_data(int fd, void* buf, int32_t len) {
 VOK_C_API ChannelStatus vokpkcs11_comm_client_init(const char* serverId) {
     return vokcomm::noThrow(CHANNEL_OUT_OF_MEMORY, [&] {
         VOK_LOGD("Entry server id %s", serverId != nullptr ? serverId : "(null)");
+        ClientLockGuard lock;
         if (initialized == 1) {
             VOK_LOGD("Already initialized");
             return static_cast<int32_t>(CHANNEL_ALREADY_INITIALIZED);
         }
-        return connectAndCheckVersion(serverId);
+        const int32_t status = connectAndCheckVersion(serverId);
+        if (status != CHANNEL_OK) return status;
+        initialized = 1;
+        VOK_LOGD("Exit - Init success");
+        return status;
     });
 }
 
@@ -243,18 +286,23 @@ VOK_C_API ChannelStatus vokpkcs11_comm_client_execute_command(const void* reques
             return static_cast<int32_t>(CHANNEL_NOT_INITIALIZED);
         }
         ClientLockGuard lock;
+        if (!initialized) {  // a deinit came first
+            VOK_LOGD("Not initialized");
+            return static_cast<int32_t>(CHANNEL_NOT_INITIALIZED);
+        }
         return exchangeLocked(request, requestLength, response, responseLength);
     });
 }
 
 VOK_C_API ChannelStatus vokpkcs11_comm_client_deinit(void) {
     VOK_LOGD("Entry");
+    ClientLockGuard lock;
     if (!initialized) {
         VOK_LOGD("Not initialized");
         return CHANNEL_NOT_INITIALIZED;
     }
-    pthread_mutex_destroy(&clientLock);
     closeSocket();
+    connectionUsable = false;
     initialized = 0;
     VOK_LOGD("Exit - Success");
     return CHANNEL_OK;

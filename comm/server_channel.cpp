@@ -193,9 +193,12 @@ int32_t processClientCommand(int fd) {
     }
     recordRequestTime();
 
-    // The peer decides the size; a negative one fails here. The unread payload
-    // is then taken for the next header.
-    MallocBuffer payload(std::malloc(static_cast<size_t>(header.data_len)), &std::free);
+    // The peer decides the size; a negative one fails here like an allocation
+    // failure, without being handed to malloc. The unread payload is then
+    // taken for the next header.
+    MallocBuffer payload(
+        header.data_len < 0 ? nullptr : std::malloc(static_cast<size_t>(header.data_len)),
+        &std::free);
     if (!payload) {
         VOK_LOGD("Malloc failed");
         return CHANNEL_OUT_OF_MEMORY;
@@ -222,12 +225,10 @@ void serveClient(int fd) {
     } while (!closesConnection(status));
 }
 
-bool isResourceShortage(int error) {
-    return error == EMFILE || error == ENFILE || error == ENOBUFS || error == ENOMEM;
-}
-
-// Never hands back -1: a failed accept is logged and tried again, after a
-// pause when the process or system has run out of something.
+// Never hands back -1: a failed accept is logged and tried again. Only a
+// client that gave up while queued is retried at once; any other error may
+// last (no descriptors left, a broken listening socket), so it is retried
+// after a pause rather than in a loop that would burn the service's CPU.
 int acceptClient(int fd) {
     for (;;) {
         int client = accept(fd, nullptr, nullptr);
@@ -235,7 +236,7 @@ int acceptClient(int fd) {
         const int error = errno;
         if (error == EINTR) continue;
         VOK_LOGD("socket accept failed");
-        if (isResourceShortage(error)) usleep(kAcceptBackoffMicros);
+        if (error != ECONNABORTED) usleep(kAcceptBackoffMicros);
     }
 }
 

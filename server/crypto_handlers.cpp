@@ -21,7 +21,7 @@ void logOutputAllocated() { VOK_LOGD("sigdata memory allocated"); }
 std::string C_EncryptInit_Server(const std::string& request) {
     return serve(request, "C_EncryptInit", [](pkcs11::OperationResult&) {
         const pkcs11::C_EncryptInit& m = operation.encinit();
-        NativeMechanism mechanism(m.mechanism());
+        NativeMechanism mechanism(VOK_SENT(m, mechanism));
         rv = ckpFunctions->C_EncryptInit(m.hsession(), mechanism.get(), m.hkey());
     });
 }
@@ -29,7 +29,8 @@ std::string C_EncryptInit_Server(const std::string& request) {
 std::string C_Encrypt_Server(const std::string& request) {
     return serve(request, "C_Encrypt", [](pkcs11::OperationResult& res) {
         const pkcs11::C_Encrypt& m = operation.enc();
-        DataBuffers io = singlePart(m.pdata(), m.uldatalen(), m.pulencrypteddatalen());
+        DataBuffers io = singlePart(VOK_SENT(m, pdata), m.uldatalen(), m.has_pencrypteddata(),
+                                    m.pulencrypteddatalen());
         rv = ckpFunctions->C_Encrypt(m.hsession(), io.input.data(), m.uldatalen(), io.output.data(),
                                      io.output.length());
         res.mutable_encres()->set_pencrypteddata(io.output.written());
@@ -40,7 +41,8 @@ std::string C_Encrypt_Server(const std::string& request) {
 std::string C_EncryptUpdate_Server(const std::string& request) {
     return serve(request, "C_EncryptUpdate", [](pkcs11::OperationResult& res) {
         const pkcs11::C_EncryptUpdate& m = operation.encryptupdate();
-        DataBuffers io = multiPart(m.ppart(), m.ulpartlen(), m.pulencryptedpartlen());
+        DataBuffers io = multiPart(VOK_SENT(m, ppart), m.ulpartlen(), m.has_pencryptedpart(),
+                                   m.pulencryptedpartlen());
         rv = ckpFunctions->C_EncryptUpdate(m.hsession(), io.input.data(), m.ulpartlen(),
                                            io.output.data(), io.output.length());
         res.mutable_encryptupdateres()->set_pencryptedpart(io.output.written());
@@ -51,7 +53,7 @@ std::string C_EncryptUpdate_Server(const std::string& request) {
 std::string C_EncryptFinal_Server(const std::string& request) {
     return serve(request, "C_EncryptFinal", [](pkcs11::OperationResult& res) {
         const pkcs11::C_EncryptFinal& m = operation.encryptfinal();
-        Output out = finalPart(m.pullastencryptedpartlen());
+        Output out(m.has_plastencryptedpart(), m.pullastencryptedpartlen());
         rv = ckpFunctions->C_EncryptFinal(m.hsession(), out.data(), out.length());
         res.mutable_encryptfinalres()->set_plastencryptedpart(out.written());
         res.mutable_encryptfinalres()->set_pullastencryptedpartlen(out.reported());
@@ -63,7 +65,7 @@ std::string C_EncryptFinal_Server(const std::string& request) {
 std::string C_DecryptInit_Server(const std::string& request) {
     return serve(request, "C_DecryptInit", [](pkcs11::OperationResult&) {
         const pkcs11::C_DecryptInit& m = operation.decint();
-        NativeMechanism mechanism(m.mechanism());
+        NativeMechanism mechanism(VOK_SENT(m, mechanism));
         rv = ckpFunctions->C_DecryptInit(m.hsession(), mechanism.get(), m.hkey());
     });
 }
@@ -71,7 +73,8 @@ std::string C_DecryptInit_Server(const std::string& request) {
 std::string C_Decrypt_Server(const std::string& request) {
     return serve(request, "C_Decrypt", [](pkcs11::OperationResult& res) {
         const pkcs11::C_Decrypt& m = operation.dec();
-        DataBuffers io = singlePart(m.pencrypteddata(), m.ulencrypteddatalen(), m.puldatalen());
+        DataBuffers io = singlePart(VOK_SENT(m, pencrypteddata), m.ulencrypteddatalen(),
+                                    m.has_pdata(), m.puldatalen());
         rv = ckpFunctions->C_Decrypt(m.hsession(), io.input.data(), m.ulencrypteddatalen(),
                                      io.output.data(), io.output.length());
         res.mutable_decres()->set_pdata(io.output.written());
@@ -82,7 +85,8 @@ std::string C_Decrypt_Server(const std::string& request) {
 std::string C_DecryptUpdate_Server(const std::string& request) {
     return serve(request, "C_DecryptUpdate", [](pkcs11::OperationResult& res) {
         const pkcs11::C_DecryptUpdate& m = operation.decryptupdate();
-        DataBuffers io = multiPart(m.pencryptedpart(), m.ulencryptedpartlen(), m.pulpartlen());
+        DataBuffers io = multiPart(VOK_SENT(m, pencryptedpart), m.ulencryptedpartlen(),
+                                   m.has_ppart(), m.pulpartlen());
         logOutputAllocated();
         rv = ckpFunctions->C_DecryptUpdate(m.hsession(), io.input.data(), m.ulencryptedpartlen(),
                                            io.output.data(), io.output.length());
@@ -94,7 +98,7 @@ std::string C_DecryptUpdate_Server(const std::string& request) {
 std::string C_DecryptFinal_Server(const std::string& request) {
     return serve(request, "C_DecryptFinal", [](pkcs11::OperationResult& res) {
         const pkcs11::C_DecryptFinal& m = operation.decryptfinal();
-        Output out = finalPart(m.pullastpartlen());
+        Output out(m.has_plastpart(), m.pullastpartlen());
         rv = ckpFunctions->C_DecryptFinal(m.hsession(), out.data(), out.length());
         res.mutable_decryptfinalres()->set_plastpart(out.written());
         res.mutable_decryptfinalres()->set_pullastpartlen(out.reported());
@@ -106,7 +110,7 @@ std::string C_DecryptFinal_Server(const std::string& request) {
 std::string C_DigestInit_Server(const std::string& request) {
     return serve(request, "C_DigestInit", [](pkcs11::OperationResult&) {
         const pkcs11::C_DigestInit& m = operation.digestint();
-        NativeMechanism mechanism(m.mechanism());
+        NativeMechanism mechanism(VOK_SENT(m, mechanism));
         rv = ckpFunctions->C_DigestInit(m.hsession(), mechanism.get());
     });
 }
@@ -114,7 +118,8 @@ std::string C_DigestInit_Server(const std::string& request) {
 std::string C_Digest_Server(const std::string& request) {
     return serve(request, "C_Digest", [](pkcs11::OperationResult& res) {
         const pkcs11::C_Digest& m = operation.digest();
-        DataBuffers io = singlePart(m.pdata(), m.uldatalen(), m.puldigestlen());
+        DataBuffers io =
+            singlePart(VOK_SENT(m, pdata), m.uldatalen(), m.has_pdigest(), m.puldigestlen());
         rv = ckpFunctions->C_Digest(m.hsession(), io.input.data(), m.uldatalen(), io.output.data(),
                                     io.output.length());
         res.mutable_digestres()->set_pdigest(io.output.written());
@@ -125,7 +130,7 @@ std::string C_Digest_Server(const std::string& request) {
 std::string C_DigestUpdate_Server(const std::string& request) {
     return serve(request, "C_DigestUpdate", [](pkcs11::OperationResult&) {
         const pkcs11::C_DigestUpdate& m = operation.digestupdate();
-        Bytes part = fromRequest(m.ppart(), m.ulpartlen());
+        Input part(VOK_SENT(m, ppart), m.ulpartlen());
         rv = ckpFunctions->C_DigestUpdate(m.hsession(), part.data(), m.ulpartlen());
     });
 }
@@ -140,7 +145,7 @@ std::string C_DigestKey_Server(const std::string& request) {
 std::string C_DigestFinal_Server(const std::string& request) {
     return serve(request, "C_DigestFinal", [](pkcs11::OperationResult& res) {
         const pkcs11::C_DigestFinal& m = operation.digestfinal();
-        Output out = finalPart(m.puldigestlen());
+        Output out(m.has_pdigest(), m.puldigestlen());
         rv = ckpFunctions->C_DigestFinal(m.hsession(), out.data(), out.length());
         res.mutable_digestfinalres()->set_pdigest(out.written());
         res.mutable_digestfinalres()->set_puldigestlen(out.reported());
@@ -152,7 +157,7 @@ std::string C_DigestFinal_Server(const std::string& request) {
 std::string C_SignInit_Server(const std::string& request) {
     return serve(request, "C_SignInit", [](pkcs11::OperationResult&) {
         const pkcs11::C_SignInit& m = operation.signinit();
-        NativeMechanism mechanism(m.mechanism());
+        NativeMechanism mechanism(VOK_SENT(m, mechanism));
         rv = ckpFunctions->C_SignInit(m.hsession(), mechanism.get(), m.hkey());
     });
 }
@@ -161,7 +166,8 @@ std::string C_Sign_Server(const std::string& request) {
     return serve(request, "C_Sign", [](pkcs11::OperationResult& res) {
         logModulePresent();
         const pkcs11::C_Sign& m = operation.sign();
-        DataBuffers io = singlePart(m.pdata(), m.uldatalen(), m.pulsignaturelen());
+        DataBuffers io =
+            singlePart(VOK_SENT(m, pdata), m.uldatalen(), m.has_psignature(), m.pulsignaturelen());
         logOutputAllocated();
         rv = ckpFunctions->C_Sign(m.hsession(), io.input.data(), m.uldatalen(), io.output.data(),
                                   io.output.length());
@@ -174,7 +180,7 @@ std::string C_SignUpdate_Server(const std::string& request) {
     return serve(request, "C_SignUpdate", [](pkcs11::OperationResult&) {
         logModulePresent();
         const pkcs11::C_SignUpdate& m = operation.signupdate();
-        Bytes part = fromRequest(m.ppart(), m.ulpartlen());
+        Input part(VOK_SENT(m, ppart), m.ulpartlen());
         rv = ckpFunctions->C_SignUpdate(m.hsession(), part.data(), m.ulpartlen());
     });
 }
@@ -183,7 +189,7 @@ std::string C_SignFinal_Server(const std::string& request) {
     return serve(request, "C_SignFinal", [](pkcs11::OperationResult& res) {
         logModulePresent();
         const pkcs11::C_SignFinal& m = operation.signfinal();
-        Output out = finalPart(m.pulsignaturelen());
+        Output out(m.has_psignature(), m.pulsignaturelen());
         logOutputAllocated();
         rv = ckpFunctions->C_SignFinal(m.hsession(), out.data(), out.length());
         res.mutable_signfinalres()->set_psignature(out.written());
@@ -194,7 +200,7 @@ std::string C_SignFinal_Server(const std::string& request) {
 std::string C_SignRecoverInit_Server(const std::string& request) {
     return serve(request, "C_SignRecoverInit", [](pkcs11::OperationResult&) {
         const pkcs11::C_SignRecoverInit& m = operation.signrecoverinit();
-        NativeMechanism mechanism(m.pmechanism());
+        NativeMechanism mechanism(VOK_SENT(m, pmechanism));
         rv = ckpFunctions->C_SignRecoverInit(m.hsession(), mechanism.get(), m.hkey());
     });
 }
@@ -203,7 +209,8 @@ std::string C_SignRecover_Server(const std::string& request) {
     return serve(request, "C_SignRecover", [](pkcs11::OperationResult& res) {
         logModulePresent();
         const pkcs11::C_SignRecover& m = operation.signrecover();
-        DataBuffers io = multiPart(m.pdata(), m.uldatalen(), m.pulsignaturelen());
+        DataBuffers io =
+            multiPart(VOK_SENT(m, pdata), m.uldatalen(), m.has_psignature(), m.pulsignaturelen());
         logOutputAllocated();
         rv = ckpFunctions->C_SignRecover(m.hsession(), io.input.data(), m.uldatalen(),
                                          io.output.data(), io.output.length());
@@ -217,7 +224,7 @@ std::string C_SignRecover_Server(const std::string& request) {
 std::string C_VerifyInit_Server(const std::string& request) {
     return serve(request, "C_VerifyInit", [](pkcs11::OperationResult&) {
         const pkcs11::C_VerifyInit& m = operation.verifyinit();
-        NativeMechanism mechanism(m.mechanism());
+        NativeMechanism mechanism(VOK_SENT(m, mechanism));
         rv = ckpFunctions->C_VerifyInit(m.hsession(), mechanism.get(), m.hkey());
     });
 }
@@ -228,7 +235,8 @@ std::string C_VerifyInit_Server(const std::string& request) {
 std::string C_Verify_Server(const std::string& request) {
     return serve(request, "C_Verify", [](pkcs11::OperationResult& res) {
         const pkcs11::C_Verify& m = operation.verify();
-        DataBuffers io = singlePart(m.pdata(), m.uldatalen(), m.ulsignaturelen());
+        DataBuffers io =
+            singlePart(VOK_SENT(m, pdata), m.uldatalen(), m.has_psignature(), m.ulsignaturelen());
         rv = ckpFunctions->C_Verify(m.hsession(), io.input.data(), m.uldatalen(), io.output.data(),
                                     m.ulsignaturelen());
         res.mutable_verifyres()->set_psignature(io.output.written());
@@ -240,7 +248,7 @@ std::string C_VerifyUpdate_Server(const std::string& request) {
     return serve(request, "C_VerifyUpdate", [](pkcs11::OperationResult&) {
         logModulePresent();
         const pkcs11::C_VerifyUpdate& m = operation.verifyupdate();
-        Bytes part = fromRequest(m.ppart(), m.ulpartlen());
+        Input part(VOK_SENT(m, ppart), m.ulpartlen());
         rv = ckpFunctions->C_VerifyUpdate(m.hsession(), part.data(), m.ulpartlen());
     });
 }
@@ -249,7 +257,7 @@ std::string C_VerifyFinal_Server(const std::string& request) {
     return serve(request, "C_VerifyFinal", [](pkcs11::OperationResult&) {
         logModulePresent();
         const pkcs11::C_VerifyFinal& m = operation.verifyfinal();
-        Bytes signature = fromRequest(m.psignature(), m.ulsignaturelen());
+        Input signature(VOK_SENT(m, psignature), m.ulsignaturelen());
         rv = ckpFunctions->C_VerifyFinal(m.hsession(), signature.data(), m.ulsignaturelen());
     });
 }
@@ -257,7 +265,7 @@ std::string C_VerifyFinal_Server(const std::string& request) {
 std::string C_VerifyRecoverInit_Server(const std::string& request) {
     return serve(request, "C_VerifyRecoverInit", [](pkcs11::OperationResult&) {
         const pkcs11::C_VerifyRecoverInit& m = operation.verifyrecoverinit();
-        NativeMechanism mechanism(m.pmechanism());
+        NativeMechanism mechanism(VOK_SENT(m, pmechanism));
         rv = ckpFunctions->C_VerifyRecoverInit(m.hsession(), mechanism.get(), m.hkey());
     });
 }
@@ -266,7 +274,8 @@ std::string C_VerifyRecover_Server(const std::string& request) {
     return serve(request, "C_VerifyRecover", [](pkcs11::OperationResult& res) {
         logModulePresent();
         const pkcs11::C_VerifyRecover& m = operation.verifyrecover();
-        DataBuffers io = multiPart(m.psignature(), m.ulsignaturelen(), m.puldatalen());
+        DataBuffers io =
+            multiPart(VOK_SENT(m, psignature), m.ulsignaturelen(), m.has_pdata(), m.puldatalen());
         logOutputAllocated();
         rv = ckpFunctions->C_VerifyRecover(m.hsession(), io.input.data(), m.ulsignaturelen(),
                                            io.output.data(), io.output.length());
@@ -280,7 +289,8 @@ std::string C_VerifyRecover_Server(const std::string& request) {
 std::string C_DigestEncryptUpdate_Server(const std::string& request) {
     return serve(request, "C_DigestEncryptUpdate", [](pkcs11::OperationResult& res) {
         const pkcs11::C_DigestEncryptUpdate& m = operation.digestencryptupdate();
-        DataBuffers io = multiPart(m.ppart(), m.ulpartlen(), m.pulencryptedpartlen());
+        DataBuffers io = multiPart(VOK_SENT(m, ppart), m.ulpartlen(), m.has_pencryptedpart(),
+                                   m.pulencryptedpartlen());
         rv = ckpFunctions->C_DigestEncryptUpdate(m.hsession(), io.input.data(), m.ulpartlen(),
                                                  io.output.data(), io.output.length());
         res.mutable_digestencryptupdateres()->set_pencryptedpart(io.output.written());
@@ -291,7 +301,8 @@ std::string C_DigestEncryptUpdate_Server(const std::string& request) {
 std::string C_DecryptDigestUpdate_Server(const std::string& request) {
     return serve(request, "C_DecryptDigestUpdate", [](pkcs11::OperationResult& res) {
         const pkcs11::C_DecryptDigestUpdate& m = operation.decryptdigestupdate();
-        DataBuffers io = multiPart(m.pencryptedpart(), m.ulencryptedpartlen(), m.pulpartlen());
+        DataBuffers io = multiPart(VOK_SENT(m, pencryptedpart), m.ulencryptedpartlen(),
+                                   m.has_ppart(), m.pulpartlen());
         rv = ckpFunctions->C_DecryptDigestUpdate(m.hsession(), io.input.data(),
                                                  m.ulencryptedpartlen(), io.output.data(),
                                                  io.output.length());
@@ -303,7 +314,8 @@ std::string C_DecryptDigestUpdate_Server(const std::string& request) {
 std::string C_SignEncryptUpdate_Server(const std::string& request) {
     return serve(request, "C_SignEncryptUpdate", [](pkcs11::OperationResult& res) {
         const pkcs11::C_SignEncryptUpdate& m = operation.signencryptupdate();
-        DataBuffers io = multiPart(m.ppart(), m.ulpartlen(), m.pulencryptedpartlen());
+        DataBuffers io = multiPart(VOK_SENT(m, ppart), m.ulpartlen(), m.has_pencryptedpart(),
+                                   m.pulencryptedpartlen());
         rv = ckpFunctions->C_SignEncryptUpdate(m.hsession(), io.input.data(), m.ulpartlen(),
                                                io.output.data(), io.output.length());
         res.mutable_signencryptupdateres()->set_pencryptedpart(io.output.written());
@@ -314,7 +326,8 @@ std::string C_SignEncryptUpdate_Server(const std::string& request) {
 std::string C_DecryptVerifyUpdate_Server(const std::string& request) {
     return serve(request, "C_DecryptVerifyUpdate", [](pkcs11::OperationResult& res) {
         const pkcs11::C_DecryptVerifyUpdate& m = operation.decryptverifyupdate();
-        DataBuffers io = multiPart(m.pencryptedpart(), m.ulencryptedpartlen(), m.pulpartlen());
+        DataBuffers io = multiPart(VOK_SENT(m, pencryptedpart), m.ulencryptedpartlen(),
+                                   m.has_ppart(), m.pulpartlen());
         rv = ckpFunctions->C_DecryptVerifyUpdate(m.hsession(), io.input.data(),
                                                  m.ulencryptedpartlen(), io.output.data(),
                                                  io.output.length());

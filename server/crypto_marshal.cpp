@@ -16,28 +16,27 @@ void requireOneFrame(uint64_t first, uint64_t second) {
 
 }  // namespace
 
-NativeMechanism::NativeMechanism(const pkcs11::CK_MECHANISM& sent)
-    : parameter_(fromRequest(sent.pparameter(), sent.ulparameterlen())),
-      mechanism_{sent.mechanism(), parameter_.data(), sent.ulparameterlen()},
-      copy_(ParameterCopy::of(sent)) {
+NativeMechanism::NativeMechanism(Sent<pkcs11::CK_MECHANISM> sent)
+    : present_(sent.present),
+      parameter_(VOK_SENT(sent.value, pparameter), sent.value.ulparameterlen()),
+      mechanism_{sent.value.mechanism(), parameter_.data(), sent.value.ulparameterlen()},
+      copy_(present_ ? ParameterCopy::of(sent.value) : nullptr) {
     if (copy_) mechanism_.pParameter = copy_->data(), mechanism_.ulParameterLen = copy_->size();
 }
 
-Output::Output(Bytes buffer) : buffer_(std::move(buffer)), length_(buffer_.count()) {}
-
-DataBuffers singlePart(const std::string& input, uint64_t inputLength, uint64_t capacity) {
+DataBuffers singlePart(Sent<std::string> input, uint64_t inputLength, bool outputPresent,
+                       uint64_t capacity) {
     requireOneFrame(inputLength, capacity);
-    return DataBuffers{fromRequest(input, inputLength), Output(Bytes(capacity))};
+    return DataBuffers{Input(input, inputLength), Output(outputPresent, capacity)};
 }
 
-DataBuffers multiPart(const std::string& input, uint64_t inputLength, uint64_t capacity) {
+DataBuffers multiPart(Sent<std::string> input, uint64_t inputLength, bool outputPresent,
+                      uint64_t capacity) {
     // Never below the told input length: a longer input is not read past its buffer.
     const uint64_t inputSize = std::max(capacity, inputLength);
     requireOneFrame(inputSize, capacity);
-    return DataBuffers{fromRequest(input, inputSize), Output(Bytes(capacity))};
+    return DataBuffers{Input(input, inputSize), Output(outputPresent, capacity)};
 }
-
-Output finalPart(uint64_t capacity) { return Output(Bytes(capacity)); }
 
 }  // namespace server
 }  // namespace vok

@@ -5,7 +5,7 @@
 // the sizing of data buffers. Every buffer is allocated once from the lengths
 // in the request; the module is never asked for a size and never called
 // twice. Input-only calls (C_DigestUpdate, C_SignUpdate, C_VerifyUpdate,
-// C_VerifyFinal) take their input with fromRequest.
+// C_VerifyFinal) take theirs as an Input.
 
 #include <string>
 
@@ -16,15 +16,17 @@ namespace vok {
 namespace server {
 
 // The client's mechanism for the module: its type, and a parameter buffer of
-// exactly ulParameterLen bytes, never NULL even for 0. Plain parameters pass
-// as bytes; a structure that holds pointers is the service's own copy, built
-// from its by-value form (by_value.h), or the call is refused.
+// exactly ulParameterLen bytes, never NULL even for 0 unless the client's was
+// NULL. The mechanism itself is NULL when the request carries none. Plain
+// parameters pass as bytes; a structure that holds pointers is the service's
+// own copy, built from its by-value form (by_value.h), or the call is
+// refused.
 class NativeMechanism {
 public:
-    explicit NativeMechanism(const pkcs11::CK_MECHANISM& sent);
+    explicit NativeMechanism(Sent<pkcs11::CK_MECHANISM> sent);
     NativeMechanism(const NativeMechanism&) = delete;
     NativeMechanism& operator=(const NativeMechanism&) = delete;
-    CK_MECHANISM_PTR get() { return &mechanism_; }
+    CK_MECHANISM_PTR get() { return present_ ? &mechanism_ : nullptr; }
 
     // What the module wrote into the parameter's output members, for the
     // answers of C_GenerateKey, C_UnwrapKey and C_DeriveKey; nothing for a
@@ -35,47 +37,28 @@ public:
     }
 
 private:
-    Bytes parameter_;
+    bool present_;
+    Input parameter_;
     CK_MECHANISM mechanism_;
     std::unique_ptr<ParameterCopy> copy_;
 };
 
-// A buffer the module writes, with its in/out length, which starts at the
-// buffer's size (the client's capacity). Never NULL, even for capacity 0: a
-// client's length query reaches the module as a zero-capacity buffer and
-// comes back with CKR_BUFFER_TOO_SMALL and the needed length.
-class Output {
-public:
-    explicit Output(Bytes buffer);
-    CK_BYTE_PTR data() const { return buffer_.data(); }
-    CK_ULONG_PTR length() { return &length_; }
-    // The length as the module left it, sent back whatever rv is.
-    CK_ULONG reported() const { return length_; }
-    // The first reported() bytes, never more than were allocated.
-    std::string written() const { return leading(buffer_, length_); }
-
-private:
-    Bytes buffer_;
-    CK_ULONG length_;
-};
-
 struct DataBuffers {
-    Bytes input;
+    Input input;
     Output output;
 };
 
 // Single-part calls (encrypt, decrypt, digest, sign; C_Verify's signature
 // takes the output's place): the input at its stated length, the output at the
 // client's capacity.
-DataBuffers singlePart(const std::string& input, uint64_t inputLength, uint64_t capacity);
+DataBuffers singlePart(Sent<std::string> input, uint64_t inputLength, bool outputPresent,
+                       uint64_t capacity);
 
 // Multi-part updates, the recovering calls and the dual-function updates:
 // both buffers at the output capacity (the input never shorter than the length
 // the module is told), the input filled to its size from the request.
-DataBuffers multiPart(const std::string& input, uint64_t inputLength, uint64_t capacity);
-
-// Finals: an output buffer only.
-Output finalPart(uint64_t capacity);
+DataBuffers multiPart(Sent<std::string> input, uint64_t inputLength, bool outputPresent,
+                      uint64_t capacity);
 
 }  // namespace server
 }  // namespace vok

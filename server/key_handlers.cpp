@@ -11,7 +11,7 @@ using namespace vok::server;
 std::string C_GenerateKey_Server(const std::string& request) {
     return serve(request, "C_GenerateKey", [](pkcs11::OperationResult& res) {
         const pkcs11::C_GenerateKey& m = operation.generatekey();
-        NativeMechanism mechanism(m.pmechanism());
+        NativeMechanism mechanism(VOK_SENT(m, pmechanism));
         NativeTemplate tmpl(m.ptemplate(), m.ulcount(), kInputTemplate);
         CK_OBJECT_HANDLE key = 0;
         rv = ckpFunctions->C_GenerateKey(m.hsession(), mechanism.get(), tmpl.data(), tmpl.count(),
@@ -24,7 +24,7 @@ std::string C_GenerateKey_Server(const std::string& request) {
 std::string C_GenerateKeyPair_Server(const std::string& request) {
     return serve(request, "C_GenerateKeyPair", [](pkcs11::OperationResult& res) {
         const pkcs11::C_GenerateKeyPair& m = operation.generatekeypair();
-        NativeMechanism mechanism(m.pmechanism());
+        NativeMechanism mechanism(VOK_SENT(m, pmechanism));
         NativeTemplate publicTmpl(m.ppublickeytemplate(), m.ulpublickeyattributecount(),
                                   kInputTemplate);
         NativeTemplate privateTmpl(m.pprivatekeytemplate(), m.ulprivatekeyattributecount(),
@@ -42,8 +42,8 @@ std::string C_GenerateKeyPair_Server(const std::string& request) {
 std::string C_WrapKey_Server(const std::string& request) {
     return serve(request, "C_WrapKey", [](pkcs11::OperationResult& res) {
         const pkcs11::C_WrapKey& m = operation.wrapkey();
-        NativeMechanism mechanism(m.pmechanism());
-        Output wrapped(fromRequest(m.pwrappedkey(), m.pulwrappedkeylen()));
+        NativeMechanism mechanism(VOK_SENT(m, pmechanism));
+        Output wrapped(VOK_SENT(m, pwrappedkey), m.pulwrappedkeylen());
         rv = ckpFunctions->C_WrapKey(m.hsession(), mechanism.get(), m.hwrappingkey(), m.hkey(),
                                      wrapped.data(), wrapped.length());
         res.mutable_wrapkeyres()->set_pwrappedkey(wrapped.written());
@@ -55,8 +55,8 @@ std::string C_WrapKey_Server(const std::string& request) {
 std::string C_UnWrapKey_Server(const std::string& request) {
     return serve(request, "C_UnWrapKey", [](pkcs11::OperationResult& res) {
         const pkcs11::C_UnwrapKey& m = operation.unwrapkey();
-        NativeMechanism mechanism(m.pmechanism());
-        Bytes wrapped = fromRequest(m.pwrappedkey(), m.ulwrappedkeylen());
+        NativeMechanism mechanism(VOK_SENT(m, pmechanism));
+        Input wrapped(VOK_SENT(m, pwrappedkey), m.ulwrappedkeylen());
         NativeTemplate tmpl(m.ptemplate(), m.ulattributecount(), kInputTemplate);
         CK_OBJECT_HANDLE key = 0;
         rv = ckpFunctions->C_UnwrapKey(m.hsession(), mechanism.get(), m.hunwrappingkey(),
@@ -72,7 +72,7 @@ std::string C_UnWrapKey_Server(const std::string& request) {
 std::string C_DeriveKey_Server(const std::string& request) {
     return serve(request, "C_UnDeriveKey", [](pkcs11::OperationResult& res) {
         const pkcs11::C_DeriveKey& m = operation.derivekey();
-        NativeMechanism mechanism(m.pmechanism());
+        NativeMechanism mechanism(VOK_SENT(m, pmechanism));
         NativeTemplate tmpl(m.ptemplate(), m.ulattributecount(), kInputTemplate);
         CK_OBJECT_HANDLE key = 0;
         rv = ckpFunctions->C_DeriveKey(m.hsession(), mechanism.get(), m.hbasekey(), tmpl.data(),
@@ -85,9 +85,9 @@ std::string C_DeriveKey_Server(const std::string& request) {
 std::string C_GenerateRandom_Server(const std::string& request) {
     return serve(request, "C_GenerateRandom", [](pkcs11::OperationResult& res) {
         const pkcs11::C_GenerateRandom& m = operation.generaterandom();
-        Bytes random = fromRequest(m.randomdata(), m.ulrandomlen());
+        Input random(VOK_SENT(m, randomdata), m.ulrandomlen());
         rv = ckpFunctions->C_GenerateRandom(m.hsession(), random.data(), m.ulrandomlen());
-        res.mutable_generaterandomres()->set_randomdata(leading(random, m.ulrandomlen()));
+        res.mutable_generaterandomres()->set_randomdata(random.leading(m.ulrandomlen()));
         res.mutable_generaterandomres()->set_ulrandomlen(m.ulrandomlen());
     });
 }
@@ -96,9 +96,9 @@ std::string C_GenerateRandom_Server(const std::string& request) {
 std::string C_SeedRandom_Server(const std::string& request) {
     return serve(request, "C_SeedRandom", [](pkcs11::OperationResult& res) {
         const pkcs11::C_SeedRandom& m = operation.seedrandom();
-        Bytes seed = fromRequest(m.pseed(), m.ulseedlen());
+        Input seed(VOK_SENT(m, pseed), m.ulseedlen());
         rv = ckpFunctions->C_SeedRandom(m.hsession(), seed.data(), m.ulseedlen());
-        res.mutable_seedrandomres()->set_pseed(leading(seed, m.ulseedlen()));
+        res.mutable_seedrandomres()->set_pseed(seed.leading(m.ulseedlen()));
         res.mutable_seedrandomres()->set_ulseedlen(m.ulseedlen());
     });
 }

@@ -45,6 +45,25 @@ std::string leading(const Bytes& buffer, CK_ULONG length) {
     return std::string(reinterpret_cast<const char*>(buffer.data()), static_cast<size_t>(n));
 }
 
+Input::Input(Sent<std::string> sent, uint64_t length) {
+    Bytes::checkCount(length);
+    if (sent.present) bytes_.emplace(fromRequest(sent.value, length));
+}
+
+std::string Input::leading(CK_ULONG length) const {
+    return bytes_ ? server::leading(*bytes_, length) : std::string();
+}
+
+Output::Output(bool present, uint64_t capacity) : length_(capacity) {
+    Bytes::checkCount(capacity);
+    if (present) buffer_.emplace(capacity);
+}
+
+Output::Output(Sent<std::string> initial, uint64_t capacity) : length_(capacity) {
+    Bytes::checkCount(capacity);
+    if (initial.present) buffer_.emplace(fromRequest(initial.value, capacity));
+}
+
 std::array<CK_UTF8CHAR, 32> paddedLabel(const std::string& sent) {
     std::array<CK_UTF8CHAR, 32> label;
     label.fill(kBlank);
@@ -85,7 +104,9 @@ void appendNumbers(NumberList* out, const CK_ULONG* values, uint64_t n) {
 
 NativeTemplate::NativeTemplate(const AttributeList& sent, CK_ULONG count, TemplateRule rule,
                                int depth, uint64_t* budget)
-    : attributes_(count), depth_(depth) {
+    : attributes_((Buffer<CK_ATTRIBUTE>::checkCount(count), sent.empty() ? 0 : count)),
+      count_(count),
+      depth_(depth) {
     const int n = static_cast<int>(std::min<uint64_t>(count, sent.size()));
     auto hasValue = [&](const pkcs11::CK_ATTRIBUTE& a) {
         return a.has_pvalue() || rule.alwaysCopyValue;
@@ -146,7 +167,7 @@ bool NativeTemplate::nestTemplate(const pkcs11::CK_ATTRIBUTE& sent, size_t index
 
 void NativeTemplate::echo(AttributeList* out, Echo rule) const {
     const bool log = depth_ == 0;
-    for (uint64_t i = 0; i < count(); ++i) {
+    for (uint64_t i = 0; i < attributes_.count(); ++i) {
         const CK_ATTRIBUTE& native = attributes_.data()[i];
         // The service's own record of the value buffer, not the pointer in the
         // template, which the module could have changed.

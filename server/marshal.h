@@ -55,9 +55,12 @@ struct FreeDeleter {
 template <class T>
 class Buffer {
 public:
+    // Throws std::bad_alloc for a count no request may ask for.
+    static void checkCount(uint64_t count) {
+        if (count > (sizeof(T) == 1 ? kFrameLimit : kMaxElements)) throw std::bad_alloc();
+    }
     explicit Buffer(uint64_t count) : count_(count) {
-        const uint64_t limit = sizeof(T) == 1 ? kFrameLimit : kMaxElements;
-        if (count > limit) throw std::bad_alloc();
+        checkCount(count);
         data_.reset(
             static_cast<T*>(std::calloc(count ? static_cast<size_t>(count) : 1, sizeof(T))));
         if (!data_) throw std::bad_alloc();
@@ -80,6 +83,55 @@ Bytes fromRequest(const std::string& sent, uint64_t length);
 // The first `length` bytes of a buffer the module filled, never more than
 // were allocated.
 std::string leading(const Bytes& buffer, CK_ULONG length);
+
+// A field of the request with whether it was sent at all: a client's NULL
+// pointer leaves its field absent.
+template <class T>
+struct Sent {
+    bool present;
+    const T& value;
+};
+template <class T>
+Sent<T> sent(bool present, const T& value) {
+    return {present, value};
+}
+#define VOK_SENT(message, field) ::vok::server::sent((message).has_##field(), (message).field())
+
+// A buffer the module reads: `length` bytes by fromRequest, or NULL when the
+// field was absent, so that the module answers the client's NULL as it would
+// its own caller's instead of reading zeros. A length no buffer may have gets
+// the empty answer either way.
+class Input {
+public:
+    Input(Sent<std::string> sent, uint64_t length);
+    CK_BYTE_PTR data() const { return bytes_ ? bytes_->data() : nullptr; }
+    // The first `length` bytes as they stand now; empty for NULL.
+    std::string leading(CK_ULONG length) const;
+
+private:
+    std::optional<Bytes> bytes_;
+};
+
+// A buffer the module writes, with its in/out length, which starts at the
+// client's capacity. NULL when the request left the buffer absent: a true
+// PKCS#11 length query, which leaves the module's operation active. Present,
+// even at capacity 0, it is a real buffer.
+class Output {
+public:
+    Output(bool present, uint64_t capacity);
+    // Starts as a copy of what the client sent in it (C_WrapKey).
+    Output(Sent<std::string> initial, uint64_t capacity);
+    CK_BYTE_PTR data() const { return buffer_ ? buffer_->data() : nullptr; }
+    CK_ULONG_PTR length() { return &length_; }
+    // The length as the module left it, sent back whatever rv is.
+    CK_ULONG reported() const { return length_; }
+    // The first reported() bytes, never more than were allocated.
+    std::string written() const { return buffer_ ? leading(*buffer_, length_) : std::string(); }
+
+private:
+    std::optional<Bytes> buffer_;
+    CK_ULONG length_;
+};
 
 // The 32-byte token label: what arrived, blank-padded as PKCS#11 pads labels.
 std::array<CK_UTF8CHAR, 32> paddedLabel(const std::string& sent);
@@ -139,8 +191,11 @@ class NativeTemplate {
 public:
     NativeTemplate(const AttributeList& sent, CK_ULONG count, TemplateRule rule, int depth = 0,
                    uint64_t* budget = nullptr);
-    CK_ATTRIBUTE_PTR data() const { return attributes_.data(); }
-    CK_ULONG count() const { return attributes_.count(); }
+    // NULL for a count without a single entry: the client's template was NULL.
+    CK_ATTRIBUTE_PTR data() const {
+        return count_ != 0 && attributes_.count() == 0 ? nullptr : attributes_.data();
+    }
+    CK_ULONG count() const { return count_; }
     // One message per native attribute, in order; values from the service's
     // own buffers, never more than were allocated. A template inside a value
     // goes back by value (only for a query: the others echo its length as
@@ -153,6 +208,7 @@ private:
                       uint64_t& budget);
 
     Buffer<CK_ATTRIBUTE> attributes_;
+    CK_ULONG count_;
     std::vector<std::optional<Bytes>> values_;                // one per sent entry
     std::vector<std::unique_ptr<NativeTemplate>> templates_;  // one per sent entry
     int depth_;

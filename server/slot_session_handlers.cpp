@@ -65,16 +65,17 @@ std::string C_GetMechanismInfo_Server(const std::string& request) {
 std::string C_InitToken_Server(const std::string& request) {
     return serve(request, "C_InitToken", [](pkcs11::OperationResult&) {
         const pkcs11::C_InitToken& m = operation.inittoken();
-        Bytes pin = fromRequest(m.ppin(), m.ulpinlen());
+        Input pin(VOK_SENT(m, ppin), m.ulpinlen());
         std::array<CK_UTF8CHAR, 32> label = paddedLabel(m.plabel());
-        rv = ckpFunctions->C_InitToken(m.slotid(), pin.data(), m.ulpinlen(), label.data());
+        rv = ckpFunctions->C_InitToken(m.slotid(), pin.data(), m.ulpinlen(),
+                                       m.has_plabel() ? label.data() : nullptr);
     });
 }
 
 std::string C_InitPin_Server(const std::string& request) {
     return serve(request, "C_InitPin", [](pkcs11::OperationResult&) {
         const pkcs11::C_InitPin& m = operation.initpin();
-        Bytes pin = fromRequest(m.ppin(), m.ulpinlen());
+        Input pin(VOK_SENT(m, ppin), m.ulpinlen());
         rv = ckpFunctions->C_InitPIN(m.hsession(), pin.data(), m.ulpinlen());
     });
 }
@@ -82,8 +83,8 @@ std::string C_InitPin_Server(const std::string& request) {
 std::string C_SetPin_Server(const std::string& request) {
     return serve(request, "C_SetPin", [](pkcs11::OperationResult&) {
         const pkcs11::C_SetPin& m = operation.setpin();
-        Bytes oldPin = fromRequest(m.poldpin(), m.uloldlen());
-        Bytes newPin = fromRequest(m.pnewpin(), m.ulnewlen());
+        Input oldPin(VOK_SENT(m, poldpin), m.uloldlen());
+        Input newPin(VOK_SENT(m, pnewpin), m.ulnewlen());
         rv = ckpFunctions->C_SetPIN(m.hsession(), oldPin.data(), m.uloldlen(), newPin.data(),
                                     m.ulnewlen());
     });
@@ -128,23 +129,21 @@ std::string C_GetSessionInfo_Server(const std::string& request) {
     });
 }
 
-// Always a real buffer of the stated size: there is no length query here.
 std::string C_GetOperationState_Server(const std::string& request) {
     return serve(request, "C_GetOperationState", [](pkcs11::OperationResult& res) {
         const pkcs11::C_GetOperationState& m = operation.getoperationstate();
-        Bytes state(m.puloperationstatelen());
-        CK_ULONG length = m.puloperationstatelen();
-        rv = ckpFunctions->C_GetOperationState(m.hsession(), state.data(), &length);
+        Output state(m.has_poperationstate(), m.puloperationstatelen());
+        rv = ckpFunctions->C_GetOperationState(m.hsession(), state.data(), state.length());
         pkcs11::C_GetOperationState_Response* out = res.mutable_getoperationstateres();
-        out->set_poperationstate(leading(state, length));
-        out->set_puloperationstatelen(length);
+        out->set_poperationstate(state.written());
+        out->set_puloperationstatelen(state.reported());
     });
 }
 
 std::string C_SetOperationState_Server(const std::string& request) {
     return serve(request, "C_SetOperationState", [](pkcs11::OperationResult&) {
         const pkcs11::C_SetOperationState& m = operation.setoperationstate();
-        Bytes state = fromRequest(m.poperationstate(), m.uloperationstatelen());
+        Input state(VOK_SENT(m, poperationstate), m.uloperationstatelen());
         rv = ckpFunctions->C_SetOperationState(m.hsession(), state.data(), m.uloperationstatelen(),
                                                m.hencryptionkey(), m.hauthenticationkey());
     });
@@ -153,7 +152,7 @@ std::string C_SetOperationState_Server(const std::string& request) {
 std::string C_Login_Server(const std::string& request) {
     return serve(request, "C_Login", [](pkcs11::OperationResult&) {
         const pkcs11::C_Login& m = operation.login();
-        Bytes pin = fromRequest(m.ppin(), m.ulpinlen());
+        Input pin(VOK_SENT(m, ppin), m.ulpinlen());
         rv = ckpFunctions->C_Login(m.hsession(), m.usertype(), pin.data(), m.ulpinlen());
     });
 }

@@ -56,6 +56,17 @@ TEST_F(EveryProxy, ReturnsAllOnesAndLeavesOutputsWhenTheServiceAnswersNothing) {
     }
 }
 
+TEST_F(EveryProxy, ReturnsAllOnesWhenTheAnswerLacksItsResult) {
+    for (const ProxyCall& proxy : everyProxyCall()) {
+        SCOPED_TRACE(proxy.name);
+        pkcs11::OperationResult nameOnly;
+        nameOnly.set_name(proxy.name);
+        service.scriptRaw(nameOnly.SerializePartialAsString());
+        EXPECT_EQ(kAllOnes, run(proxy));
+        EXPECT_TRUE(untouched());
+    }
+}
+
 TEST_F(EveryProxy, InitializeArgumentsNeverReachTheService) {
     ASSERT_EQ(CKR_OK, C_Initialize(nullptr));
     const std::string withNull = service.lastRequestBytes();

@@ -1,5 +1,5 @@
-// The client's 30-second receive timeout and the drain of the late answer.
-// Labelled slow: it waits for the real timeout.
+// The client's 30-second receive timeout, and the late answer that must never
+// be taken for the next one. Labelled slow: it waits for the real timeout.
 
 #include <gtest/gtest.h>
 
@@ -14,7 +14,7 @@
 namespace voktest {
 namespace {
 
-TEST(ReceiveTimeout, IsTenAndTheLateAnswerIsDrainedBeforeTheNextExchange) {
+TEST(ReceiveTimeout, IsTenAndTheLateAnswerNeverReachesTheNextExchange) {
     LogCapture log;
     const std::string id = uniqueServerId();
     RawListener listener(id);
@@ -27,17 +27,19 @@ TEST(ReceiveTimeout, IsTenAndTheLateAnswerIsDrainedBeforeTheNextExchange) {
     handshake.join();
     ASSERT_EQ(0, status);
 
-    Gate timedOut, lateAnswerSent;
+    Gate timedOut;
     std::thread server([&] {
         WireHeader h;
         Bytes first, second;
         peer.recvFrame(&h, &first);
         timedOut.wait(std::chrono::seconds(60));
+        RawSocket fresh = listener.accept();
+        // The abandoned request is answered only now, with the next request on its way.
         peer.sendFrame({101, 104, 0, 4}, textBytes("late"));
-        lateAnswerSent.open();
-        peer.recvFrame(&h, &second);
-        EXPECT_EQ(textBytes("second"), second);
-        peer.sendFrame({101, 104, 0, 5}, textBytes("fresh"));
+        if (answerHandshake(fresh) && fresh.recvFrame(&h, &second)) {
+            EXPECT_EQ(textBytes("second"), second);
+            fresh.sendFrame({101, 104, 0, 5}, textBytes("fresh"));
+        }
     });
 
     void* response = nullptr;
@@ -50,13 +52,10 @@ TEST(ReceiveTimeout, IsTenAndTheLateAnswerIsDrainedBeforeTheNextExchange) {
     EXPECT_EQ("Client receive header failed 10", log.texts("VOKPKCS11-COMM_CLIENT").back());
     timedOut.open();
 
-    ASSERT_TRUE(lateAnswerSent.wait());
     ASSERT_EQ(0, vokpkcs11_comm_client_execute_command("second", 6, &response, &length));
     EXPECT_EQ("fresh", std::string(static_cast<const char*>(response), length));
     std::free(response);
     server.join();
-    EXPECT_TRUE(
-        inOrder(log.texts("VOKPKCS11-COMM_CLIENT"), {"Recv returned :20", "Exit - Success"}));
 }
 
 }  // namespace

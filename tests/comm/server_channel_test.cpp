@@ -5,6 +5,7 @@
 #include <sys/resource.h>
 #include <sys/time.h>
 
+#include <algorithm>
 #include <array>
 #include <atomic>
 #include <cerrno>
@@ -43,6 +44,18 @@ void operator delete[](void* p) noexcept {
 }
 
 void operator delete[](void* p, std::size_t) noexcept { operator delete[](p); }
+
+// accept() fails with EINVAL while this is above 0: an error that does not go
+// away by itself.
+std::atomic<int> failingAccepts{0};
+extern "C" int __real_accept(int fd, sockaddr* address, socklen_t* length);
+extern "C" int __wrap_accept(int fd, sockaddr* address, socklen_t* length) {
+    if (failingAccepts > 0 && failingAccepts-- > 0) {
+        errno = EINVAL;
+        return -1;
+    }
+    return __real_accept(fd, address, length);
+}
 
 namespace voktest {
 namespace {
@@ -310,12 +323,20 @@ TEST_F(ServerChannelTest, UsageTimeIsMinusOneWhileACommandIsWorkedOn) {
     ASSERT_TRUE(client.recvFrame(&h, &payload));
 
     // A window within one second, so that the request's and the response's
-    // values compare as times.
+    // values compare as times. The answer's time is recorded just after it is
+    // sent: its own log line says when.
+    auto answerTimesRecorded = [&] {
+        auto all = lines();
+        return std::count_if(all.begin(), all.end(), [](const std::string& l) {
+            return l.rfind("Last used Time Response", 0) == 0;
+        });
+    };
     timeval before, after;
     do {
+        const auto recorded = answerTimesRecorded();
         gettimeofday(&before, nullptr);
         expectVersionAnswered(client);
-        ASSERT_TRUE(waitForLine("process_client_command ret :0"));
+        ASSERT_TRUE(waitUntil([&] { return answerTimesRecorded() > recorded; }));
         gettimeofday(&after, nullptr);
     } while (before.tv_sec != after.tv_sec);
     const int32_t value = vokpkcs11_comm_server_getLastUsageTime();
@@ -372,6 +393,20 @@ TEST_F(ServerChannelTest, ThreadCreationFailureIsFourteenAndInitCanBeRetried) {
     EXPECT_EQ(14, status);
     EXPECT_EQ("Thread create failed " + std::to_string(EAGAIN), lines().back());
     expectVersionAnswered(start());
+}
+
+TEST_F(ServerChannelTest, APersistentAcceptErrorIsRetriedAfterAPauseNotInABusyLoop) {
+    failingAccepts = 1 << 30;
+    startServer(id);
+    auto failures = [&] {
+        auto all = lines();
+        return std::count(all.begin(), all.end(), "socket accept failed");
+    };
+    ASSERT_TRUE(waitUntil([&] { return failures() > 0; }));
+    std::this_thread::sleep_for(std::chrono::milliseconds(300));
+    EXPECT_LT(failures(), 20);
+    failingAccepts = 0;
+    expectVersionAnswered(connectClient());
 }
 
 TEST(ServerTransferHelpers, RejectInvalidArguments) {
@@ -448,6 +483,42 @@ TEST_F(ServerChannelTest, ConcurrentExchangesAreNeverMixedUp) {
     for (auto& thread : threads) thread.join();
     EXPECT_EQ(0, mismatches.load());
     EXPECT_FALSE(overlapped);
+}
+
+// Exchanges in flight on 8 threads while another thread takes the channel
+// down and sets it up again: an exchange may fail, never get another's answer.
+TEST_F(ServerChannelTest, SettingTheChannelUpAgainNeverMixesUpExchangesInFlight) {
+    commandHandler = [](const Bytes& request, void** response, uint32_t* length) {
+        Bytes marked = textBytes("answer to ");
+        marked.insert(marked.end(), request.begin(), request.end());
+        return answer(marked, response, length);
+    };
+    startServer(id);
+    ASSERT_EQ(0, vokpkcs11_comm_client_init(id.c_str()));
+    std::atomic<bool> done{false};
+    std::atomic<int> answered{0}, wrong{0};
+    std::vector<std::thread> threads;
+    for (int t = 0; t < 8; ++t) {
+        threads.emplace_back([&, t] {
+            for (int i = 0; i < 200; ++i) {
+                const std::string request = "t" + std::to_string(t) + "-" + std::to_string(i);
+                int32_t status = -1;
+                const std::string text = exchangeText(request, &status);
+                if (status == 0) ++(text == "answer to " + request ? answered : wrong);
+            }
+        });
+    }
+    std::thread setUp([&] {
+        while (!done) {
+            vokpkcs11_comm_client_deinit();
+            vokpkcs11_comm_client_init(id.c_str());
+        }
+    });
+    for (auto& thread : threads) thread.join();
+    done = true;
+    setUp.join();
+    EXPECT_EQ(0, wrong.load());
+    EXPECT_GT(answered.load(), 0);
 }
 
 }  // namespace

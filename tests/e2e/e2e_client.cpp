@@ -12,9 +12,12 @@
 //       C_GetInfo, C_Finalize.
 //   vok_e2e_client <library> <serverId> stall
 //       without the library: sends the header of a request and half its
-//       payload by hand, prints "stalled" and waits for standard input to end.
+//       payload by hand, prints "stalled" once the service has read all of it
+//       and waits for standard input to end.
 
 #include <dlfcn.h>
+#include <linux/sockios.h>
+#include <sys/ioctl.h>
 #include <sys/socket.h>
 #include <sys/un.h>
 #include <unistd.h>
@@ -694,6 +697,17 @@ int stall(const std::string& serverId) {
     const char half[8] = {0};
     if (!sendAll(fd, header, sizeof header) || !sendAll(fd, half, sizeof half)) {
         std::cout << "FAIL send" << std::endl;
+        return 2;
+    }
+    // Nothing left unread in the send queue means the service has read the
+    // header, recorded the request time and waits inside the payload.
+    int unread = -1;
+    for (int attempt = 0; attempt < 3000 && unread != 0; ++attempt) {
+        if (ioctl(fd, SIOCOUTQ, &unread) != 0) break;
+        if (unread != 0) std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    }
+    if (unread != 0) {
+        std::cout << "FAIL unread " << unread << std::endl;
         return 2;
     }
     std::cout << "stalled" << std::endl;

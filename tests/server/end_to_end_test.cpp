@@ -5,6 +5,8 @@
 #include <unistd.h>
 
 #include <cstring>
+#include <functional>
+#include <sstream>
 #include <string>
 #include <vector>
 
@@ -190,9 +192,13 @@ TEST_F(EndToEnd, EveryCryptographicKeyAndRandomFunction) {
     EXPECT_EQ(plain, std::string(back.begin(), back.end()));
 
     // Multi-part; a query on an update sends capacity 0 and still the whole input.
+    // A length query with nothing left to give must leave the operation active.
     auto finish = [&](CK_C_EncryptFinal fn) {
         CK_BYTE last[32] = {};
-        CK_ULONG lastLength = sizeof last;
+        CK_ULONG lastLength = 99;
+        EXPECT_EQ(CKR_OK, fn(s, nullptr, &lastLength));
+        EXPECT_EQ(0u, lastLength);
+        lastLength = sizeof last;
         EXPECT_EQ(CKR_OK, fn(s, last, &lastLength));
         EXPECT_EQ(0u, lastLength);
     };
@@ -327,6 +333,83 @@ TEST_F(EndToEnd, EveryCryptographicKeyAndRandomFunction) {
     EXPECT_TRUE(fakevendor::lastCall("C_WaitForSlotEvent").arg("pReserved").null);
     EXPECT_EQ(CKR_NO_EVENT, f->C_WaitForSlotEvent(CKF_DONT_BLOCK, &slot, nullptr));
     EXPECT_EQ(CKR_OK, f->C_Finalize(nullptr));
+}
+
+// A caller's NULL buffer, template or mechanism reaches the module as NULL:
+// never as zeros of the stated length, and a NULL output stays a length query.
+TEST_F(EndToEnd, NullBuffersTemplatesAndMechanismsReachTheModuleAsNull) {
+    ASSERT_EQ(CKR_OK, C_Initialize(nullptr));
+    CK_SESSION_HANDLE s = 0;
+    ASSERT_EQ(CKR_OK, C_OpenSession(1, CKF_SERIAL_SESSION, nullptr, nullptr, &s));
+    CK_ULONG n = 8;
+    CK_OBJECT_HANDLE h = 0, h2 = 0;
+    struct Row {
+        const char* function;
+        const char* nullArgs;  // the module's names, space-separated
+        std::function<CK_RV()> call;
+    };
+    // clang-format off
+#define NULL_ROW(function, args, ...) Row{#function, args, [&] { return function(__VA_ARGS__); }}
+    const Row rows[] = {
+        NULL_ROW(C_Encrypt, "pData pEncryptedData", s, nullptr, 8, nullptr, &n),
+        NULL_ROW(C_Decrypt, "pEncryptedData pData", s, nullptr, 8, nullptr, &n),
+        NULL_ROW(C_Digest, "pData pDigest", s, nullptr, 8, nullptr, &n),
+        NULL_ROW(C_Sign, "pData pSignature", s, nullptr, 8, nullptr, &n),
+        NULL_ROW(C_Verify, "pData pSignature", s, nullptr, 8, nullptr, 8),
+        NULL_ROW(C_EncryptUpdate, "pPart pEncryptedPart", s, nullptr, 8, nullptr, &n),
+        NULL_ROW(C_DecryptUpdate, "pEncryptedPart pPart", s, nullptr, 8, nullptr, &n),
+        NULL_ROW(C_SignRecover, "pData pSignature", s, nullptr, 8, nullptr, &n),
+        NULL_ROW(C_VerifyRecover, "pSignature pData", s, nullptr, 8, nullptr, &n),
+        NULL_ROW(C_DigestEncryptUpdate, "pPart pEncryptedPart", s, nullptr, 8, nullptr, &n),
+        NULL_ROW(C_DecryptDigestUpdate, "pEncryptedPart pPart", s, nullptr, 8, nullptr, &n),
+        NULL_ROW(C_SignEncryptUpdate, "pPart pEncryptedPart", s, nullptr, 8, nullptr, &n),
+        NULL_ROW(C_DecryptVerifyUpdate, "pEncryptedPart pPart", s, nullptr, 8, nullptr, &n),
+        NULL_ROW(C_EncryptFinal, "pLastEncryptedPart", s, nullptr, &n),
+        NULL_ROW(C_DecryptFinal, "pLastPart", s, nullptr, &n),
+        NULL_ROW(C_DigestFinal, "pDigest", s, nullptr, &n),
+        NULL_ROW(C_SignFinal, "pSignature", s, nullptr, &n),
+        NULL_ROW(C_DigestUpdate, "pPart", s, nullptr, 8),
+        NULL_ROW(C_SignUpdate, "pPart", s, nullptr, 8),
+        NULL_ROW(C_VerifyUpdate, "pPart", s, nullptr, 8),
+        NULL_ROW(C_VerifyFinal, "pSignature", s, nullptr, 8),
+        NULL_ROW(C_GetOperationState, "pOperationState", s, nullptr, &n),
+        NULL_ROW(C_SetOperationState, "pOperationState", s, nullptr, 8, 0, 0),
+        NULL_ROW(C_Login, "pPin", s, CKU_USER, nullptr, 4),
+        NULL_ROW(C_InitToken, "pPin pLabel", 2, nullptr, 4, nullptr),
+        NULL_ROW(C_SeedRandom, "pSeed", s, nullptr, 8),
+        NULL_ROW(C_GenerateRandom, "RandomData", s, nullptr, 8),
+        NULL_ROW(C_CreateObject, "pTemplate", s, nullptr, 2, &h),
+        NULL_ROW(C_CopyObject, "pTemplate", s, 1, nullptr, 2, &h),
+        NULL_ROW(C_SetAttributeValue, "pTemplate", s, 1, nullptr, 2),
+        NULL_ROW(C_GetAttributeValue, "pTemplate", s, 1, nullptr, 2),
+        NULL_ROW(C_FindObjectsInit, "pTemplate", s, nullptr, 2),
+        NULL_ROW(C_EncryptInit, "pMechanism", s, nullptr, 1),
+        NULL_ROW(C_DecryptInit, "pMechanism", s, nullptr, 1),
+        NULL_ROW(C_DigestInit, "pMechanism", s, nullptr),
+        NULL_ROW(C_SignInit, "pMechanism", s, nullptr, 1),
+        NULL_ROW(C_VerifyInit, "pMechanism", s, nullptr, 1),
+        NULL_ROW(C_SignRecoverInit, "pMechanism", s, nullptr, 1),
+        NULL_ROW(C_VerifyRecoverInit, "pMechanism", s, nullptr, 1),
+        NULL_ROW(C_GenerateKey, "pMechanism pTemplate", s, nullptr, nullptr, 2, &h),
+        NULL_ROW(C_GenerateKeyPair, "pMechanism pPublicKeyTemplate pPrivateKeyTemplate",
+                 s, nullptr, nullptr, 2, nullptr, 2, &h, &h2),
+        NULL_ROW(C_WrapKey, "pMechanism pWrappedKey", s, nullptr, 1, 2, nullptr, &n),
+        NULL_ROW(C_UnwrapKey, "pMechanism pWrappedKey pTemplate",
+                 s, nullptr, 1, nullptr, 8, nullptr, 2, &h),
+        NULL_ROW(C_DeriveKey, "pMechanism pTemplate", s, nullptr, 1, nullptr, 2, &h),
+    };
+#undef NULL_ROW
+    // clang-format on
+    for (const Row& row : rows) {
+        SCOPED_TRACE(row.function);
+        EXPECT_NE(kNoAnswer, row.call());
+        std::istringstream args(row.nullArgs);
+        for (std::string arg; args >> arg;)
+            EXPECT_TRUE(fakevendor::lastCall(row.function).arg(arg).null) << arg;
+    }
+    CK_MECHANISM noParameter{CKM_AES_CBC, nullptr, 16};
+    EXPECT_NE(kNoAnswer, C_EncryptInit(s, &noParameter, 1));
+    EXPECT_TRUE(fakevendor::lastCall("C_EncryptInit").arg("pMechanism").items.at(0).null);
 }
 
 }  // namespace

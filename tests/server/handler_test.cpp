@@ -422,7 +422,11 @@ const AnswerRow kAnswerRows[] = {
      }},
     {"OperationStateOverReportedIsCutAtTheAllocation", overReportState, C_GetOperationState_Server,
      "C_GetOperationState",
-     [](auto& op) { op.mutable_getoperationstate()->set_puloperationstatelen(3); }, CKR_OK,
+     [](auto& op) {
+         op.mutable_getoperationstate()->set_poperationstate("");
+         op.mutable_getoperationstate()->set_puloperationstatelen(3);
+     },
+     CKR_OK,
      [](Result& r) {
          r.mutable_getoperationstateres()->set_poperationstate("SSS");
          r.mutable_getoperationstateres()->set_puloperationstatelen(1000);

@@ -1,0 +1,34 @@
+#ifndef VOK_DEMO_OPENSSL_CHECKS_H
+#define VOK_DEMO_OPENSSL_CHECKS_H
+
+// Checks made outside the system, with OpenSSL's libcrypto, on what the token
+// produced through the proxy.
+
+#include <string>
+#include <vector>
+
+namespace vok {
+namespace demo {
+
+using Bytes = std::vector<unsigned char>;
+
+// An ECDSA signature over SHA-256 of `data`, as PKCS#11 gives it (r and s,
+// 32 bytes each), checked against the P-256 public key of CKA_EC_POINT (a DER
+// OCTET STRING holding the uncompressed point).
+bool verifyEcdsaP256Sha256(const Bytes& ecPoint, const Bytes& data, const Bytes& signature);
+
+// An RSA PKCS#1 v1.5 signature over SHA-256 of `data`, checked against the
+// public key of CKA_MODULUS and CKA_PUBLIC_EXPONENT.
+bool verifyRsaPkcs1Sha256(const Bytes& modulus, const Bytes& exponent, const Bytes& data,
+                          const Bytes& signature);
+
+// AES-256-CBC decryption with PKCS#7 padding; false when it fails.
+bool decryptAes256CbcPad(const Bytes& key, const Bytes& iv, const Bytes& ciphertext,
+                         Bytes* plaintext);
+
+Bytes sha256(const Bytes& data);
+
+}  // namespace demo
+}  // namespace vok
+
+#endif
