@@ -35,6 +35,19 @@ Key keyFromParameters(const char* type, const OSSL_PARAM* parameters) {
     return Key(key);
 }
 
+// The P-256 public key of a CKA_EC_POINT value: 04 41 04 x y, the OCTET
+// STRING around the 65-byte uncompressed point.
+Key p256PublicKey(const Bytes& ecPoint) {
+    if (ecPoint.size() != 67 || ecPoint[0] != 0x04 || ecPoint[1] != 65) return Key();
+    Bytes point(ecPoint.begin() + 2, ecPoint.end());
+    char group[] = "prime256v1";
+    const OSSL_PARAM parameters[] = {
+        OSSL_PARAM_construct_utf8_string(OSSL_PKEY_PARAM_GROUP_NAME, group, 0),
+        OSSL_PARAM_construct_octet_string(OSSL_PKEY_PARAM_PUB_KEY, point.data(), point.size()),
+        OSSL_PARAM_construct_end()};
+    return keyFromParameters("EC", parameters);
+}
+
 bool verifySha256(EVP_PKEY* key, const Bytes& data, const unsigned char* signature, size_t length) {
     DigestContext context(EVP_MD_CTX_new());
     return context &&
@@ -45,17 +58,8 @@ bool verifySha256(EVP_PKEY* key, const Bytes& data, const unsigned char* signatu
 }  // namespace
 
 bool verifyEcdsaP256Sha256(const Bytes& ecPoint, const Bytes& data, const Bytes& signature) {
-    // 04 41 04 x y: the OCTET STRING around the 65-byte uncompressed point.
-    if (ecPoint.size() != 67 || ecPoint[0] != 0x04 || ecPoint[1] != 65 || signature.size() != 64)
-        return false;
-    Bytes point(ecPoint.begin() + 2, ecPoint.end());
-    char group[] = "prime256v1";
-    const OSSL_PARAM parameters[] = {
-        OSSL_PARAM_construct_utf8_string(OSSL_PKEY_PARAM_GROUP_NAME, group, 0),
-        OSSL_PARAM_construct_octet_string(OSSL_PKEY_PARAM_PUB_KEY, point.data(), point.size()),
-        OSSL_PARAM_construct_end()};
-    Key key = keyFromParameters("EC", parameters);
-    if (!key) return false;
+    Key key = p256PublicKey(ecPoint);
+    if (!key || signature.size() != 64) return false;
 
     // OpenSSL takes the signature DER-encoded.
     Owned<ECDSA_SIG, ECDSA_SIG_free> sig(ECDSA_SIG_new());
@@ -113,6 +117,48 @@ Bytes sha256(const Bytes& data) {
         return Bytes();
     digest.resize(length);
     return digest;
+}
+
+bool decryptAes256Gcm(const Bytes& key, const Bytes& iv, const Bytes& aad, const Bytes& sealed,
+                      Bytes* plaintext) {
+    if (key.size() != 32 || sealed.size() < 16) return false;
+    const size_t length = sealed.size() - 16;
+    Owned<EVP_CIPHER_CTX, EVP_CIPHER_CTX_free> context(EVP_CIPHER_CTX_new());
+    Bytes out(length + 16), tag(sealed.begin() + static_cast<long>(length), sealed.end());
+    int written = 0, last = 0;
+    if (!context ||
+        EVP_DecryptInit_ex(context.get(), EVP_aes_256_gcm(), nullptr, nullptr, nullptr) != 1 ||
+        EVP_CIPHER_CTX_ctrl(context.get(), EVP_CTRL_GCM_SET_IVLEN, static_cast<int>(iv.size()),
+                            nullptr) != 1 ||
+        EVP_DecryptInit_ex(context.get(), nullptr, nullptr, key.data(), iv.data()) != 1 ||
+        EVP_DecryptUpdate(context.get(), nullptr, &written, aad.data(),
+                          static_cast<int>(aad.size())) != 1 ||
+        EVP_DecryptUpdate(context.get(), out.data(), &written, sealed.data(),
+                          static_cast<int>(length)) != 1 ||
+        EVP_CIPHER_CTX_ctrl(context.get(), EVP_CTRL_GCM_SET_TAG, 16, tag.data()) != 1 ||
+        EVP_DecryptFinal_ex(context.get(), out.data() + written, &last) != 1)
+        return false;
+    out.resize(static_cast<size_t>(written + last));
+    *plaintext = out;
+    return true;
+}
+
+Bytes ecdhP256(const Bytes& peerPoint, Bytes* ownPoint) {
+    Key peer = p256PublicKey(peerPoint);
+    Key own(EVP_EC_gen("P-256"));
+    KeyContext context(own ? EVP_PKEY_CTX_new_from_pkey(nullptr, own.get(), nullptr) : nullptr);
+    Bytes secret(32), point(65);
+    size_t secretLength = secret.size(), pointLength = 0;
+    if (!peer || !context || EVP_PKEY_derive_init(context.get()) != 1 ||
+        EVP_PKEY_derive_set_peer(context.get(), peer.get()) != 1 ||
+        EVP_PKEY_derive(context.get(), secret.data(), &secretLength) != 1 ||
+        EVP_PKEY_get_octet_string_param(own.get(), OSSL_PKEY_PARAM_PUB_KEY, point.data(),
+                                        point.size(), &pointLength) != 1)
+        return Bytes();
+    point.resize(pointLength);
+    *ownPoint = point;
+    secret.resize(secretLength);
+    return secret;
 }
 
 }  // namespace demo

@@ -28,6 +28,17 @@ bool decryptAes256CbcPad(const Bytes& key, const Bytes& iv, const Bytes& ciphert
 
 Bytes sha256(const Bytes& data);
 
+// AES-256-GCM decryption of ciphertext followed by its 16-byte tag; false
+// when the tag does not authenticate `aad` and the ciphertext.
+bool decryptAes256Gcm(const Bytes& key, const Bytes& iv, const Bytes& aad, const Bytes& sealed,
+                      Bytes* plaintext);
+
+// A fresh P-256 key of OpenSSL's: its uncompressed public point into
+// *ownPoint, and the ECDH shared secret (the x coordinate) with `peerPoint`
+// (CKA_EC_POINT, a DER OCTET STRING around an uncompressed point); empty on
+// failure.
+Bytes ecdhP256(const Bytes& peerPoint, Bytes* ownPoint);
+
 }  // namespace demo
 }  // namespace vok
 

@@ -110,11 +110,12 @@ void Session::generateEcP256(CK_OBJECT_HANDLE* publicKey, CK_OBJECT_HANDLE* priv
     CK_ATTRIBUTE privateTemplate[] = {
         attr(CKA_TOKEN, &kFalse, 1),
         attr(CKA_SIGN, &kTrue, 1),
+        attr(CKA_DERIVE, &kTrue, 1),
         attr(CKA_SENSITIVE, &kTrue, 1),
     };
     CK_MECHANISM generate = {CKM_EC_KEY_PAIR_GEN, nullptr, 0};
     check("C_GenerateKeyPair", f_->C_GenerateKeyPair(handle_, &generate, publicTemplate, 3,
-                                                     privateTemplate, 3, publicKey, privateKey));
+                                                     privateTemplate, 4, publicKey, privateKey));
 }
 
 void Session::generateRsa2048(CK_OBJECT_HANDLE* publicKey, CK_OBJECT_HANDLE* privateKey) {
@@ -178,6 +179,27 @@ Bytes Session::sign(CK_MECHANISM mechanism, CK_OBJECT_HANDLE key, const Bytes& d
     return output("C_Sign", 1024, [&](CK_BYTE* out, CK_ULONG* length) {
         return f_->C_Sign(handle_, in.data(), in.size(), out, length);
     });
+}
+
+Bytes Session::deriveEcdh(CK_OBJECT_HANDLE privateKey, const Bytes& peerPoint) {
+    Bytes point = peerPoint;
+    CK_ECDH1_DERIVE_PARAMS ecdh = {CKD_NULL, 0, nullptr, point.size(), point.data()};
+    CK_MECHANISM derive = {CKM_ECDH1_DERIVE, &ecdh, sizeof ecdh};
+    const CK_OBJECT_CLASS secret = CKO_SECRET_KEY;
+    const CK_KEY_TYPE generic = CKK_GENERIC_SECRET;
+    const CK_ULONG length = 32;
+    CK_ATTRIBUTE key[] = {
+        attr(CKA_CLASS, &secret, sizeof secret),
+        attr(CKA_KEY_TYPE, &generic, sizeof generic),
+        attr(CKA_VALUE_LEN, &length, sizeof length),
+        attr(CKA_TOKEN, &kFalse, 1),
+        attr(CKA_SENSITIVE, &kFalse, 1),
+        attr(CKA_EXTRACTABLE, &kTrue, 1),
+    };
+    CK_OBJECT_HANDLE derived = CK_INVALID_HANDLE;
+    check("C_DeriveKey",
+          f_->C_DeriveKey(handle_, &derive, privateKey, key, sizeof key / sizeof *key, &derived));
+    return attribute(derived, CKA_VALUE);
 }
 
 CK_RV Session::verify(CK_MECHANISM mechanism, CK_OBJECT_HANDLE key, const Bytes& data,

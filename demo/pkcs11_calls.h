@@ -71,6 +71,9 @@ public:
     Bytes encrypt(CK_MECHANISM mechanism, CK_OBJECT_HANDLE key, const Bytes& data);
     Bytes decrypt(CK_MECHANISM mechanism, CK_OBJECT_HANDLE key, const Bytes& data);
     Bytes sign(CK_MECHANISM mechanism, CK_OBJECT_HANDLE key, const Bytes& data);
+    // ECDH without a KDF (CKM_ECDH1_DERIVE) with the peer's uncompressed
+    // point: the shared secret, read from the derived generic secret.
+    Bytes deriveEcdh(CK_OBJECT_HANDLE privateKey, const Bytes& peerPoint);
     // C_VerifyInit, C_VerifyUpdate, C_VerifyFinal; the final call's result.
     CK_RV verify(CK_MECHANISM mechanism, CK_OBJECT_HANDLE key, const Bytes& data,
                  const Bytes& signature);

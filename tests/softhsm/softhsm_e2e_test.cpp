@@ -66,6 +66,30 @@ TEST(SoftHsmThroughProxy, AesCbcPadCiphertextDecryptsWithOpenSsl) {
     EXPECT_EQ(decrypted, plain);
 }
 
+// Parameters that hold pointers reach the token by value: GCM's IV and AAD,
+// the peer's point of ECDH. (SoftHSM2 2.6 takes OAEP with SHA-1 and no label
+// only, and has no PBKDF2; the fake module's tables cover those.)
+TEST(SoftHsmThroughProxy, AesGcmWithIvAndAadOpensWithOpenSsl) {
+    const CK_OBJECT_HANDLE key = session->generateAes256(true);
+    Bytes iv(12, 0x5a), aad = bytes("authenticated, not encrypted");
+    const Bytes plain = bytes("AES-GCM through the proxy");
+    CK_GCM_PARAMS gcm = {iv.data(), iv.size(), 96, aad.data(), aad.size(), 128};
+    const Bytes sealed = session->encrypt({CKM_AES_GCM, &gcm, sizeof gcm}, key, plain);
+    Bytes opened;
+    ASSERT_TRUE(decryptAes256Gcm(session->attribute(key, CKA_VALUE), iv, aad, sealed, &opened));
+    EXPECT_EQ(opened, plain);
+    EXPECT_EQ(session->decrypt({CKM_AES_GCM, &gcm, sizeof gcm}, key, sealed), plain);
+}
+
+TEST(SoftHsmThroughProxy, Ecdh1SecretMatchesOpenSsls) {
+    CK_OBJECT_HANDLE publicKey, privateKey;
+    session->generateEcP256(&publicKey, &privateKey);
+    Bytes peerPoint;
+    const Bytes expected = ecdhP256(session->attribute(publicKey, CKA_EC_POINT), &peerPoint);
+    ASSERT_EQ(expected.size(), 32u);
+    EXPECT_EQ(hex(session->deriveEcdh(privateKey, peerPoint)), hex(expected));
+}
+
 TEST(SoftHsmThroughProxy, Sha256DigestsMatchOpenSsl) {
     for (size_t size : {size_t(0), size_t(1), size_t(4096), size_t(1) << 20}) {
         Bytes data(size);
