@@ -3,6 +3,7 @@
 
 #define LOG_TAG "[native jni pkcs11wrapper]"
 #include "entry_frame.h"
+#include "vok_export.h"
 #include "vok_log.h"
 
 using namespace vokjni;
@@ -78,44 +79,49 @@ void inputOnly(JNIEnv* env, jobject thiz, const char* name, jlong jSession, jbyt
 
 // ---- Init calls ----------------------------------------------------------------
 
-VOK_PKCS11_METHOD(void, C_1EncryptInit)(JNIEnv* env, jobject thiz, jlong jSession,
-                                        jobject jMechanism, jlong jKey) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1EncryptInit(
+    JNIEnv* env, jobject thiz, jlong jSession, jobject jMechanism, jlong jKey) {
     initWithKey(env, thiz, __func__, jSession, jMechanism, jKey,
                 [](CK_FUNCTION_LIST_PTR f) { return f->C_EncryptInit; });
 }
 
-VOK_PKCS11_METHOD(void, C_1DecryptInit)(JNIEnv* env, jobject thiz, jlong jSession,
-                                        jobject jMechanism, jlong jKey) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1DecryptInit(
+    JNIEnv* env, jobject thiz, jlong jSession, jobject jMechanism, jlong jKey) {
     initWithKey(env, thiz, __func__, jSession, jMechanism, jKey,
                 [](CK_FUNCTION_LIST_PTR f) { return f->C_DecryptInit; });
 }
 
-VOK_PKCS11_METHOD(void, C_1SignInit)(JNIEnv* env, jobject thiz, jlong jSession, jobject jMechanism,
-                                     jlong jKey) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1SignInit(JNIEnv* env, jobject thiz,
+                                                                        jlong jSession,
+                                                                        jobject jMechanism,
+                                                                        jlong jKey) {
     initWithKey(env, thiz, __func__, jSession, jMechanism, jKey,
                 [](CK_FUNCTION_LIST_PTR f) { return f->C_SignInit; });
 }
 
-VOK_PKCS11_METHOD(void, C_1SignRecoverInit)(JNIEnv* env, jobject thiz, jlong jSession,
-                                            jobject jMechanism, jlong jKey) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1SignRecoverInit(
+    JNIEnv* env, jobject thiz, jlong jSession, jobject jMechanism, jlong jKey) {
     initWithKey(env, thiz, __func__, jSession, jMechanism, jKey,
                 [](CK_FUNCTION_LIST_PTR f) { return f->C_SignRecoverInit; });
 }
 
-VOK_PKCS11_METHOD(void, C_1VerifyInit)(JNIEnv* env, jobject thiz, jlong jSession,
-                                       jobject jMechanism, jlong jKey) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1VerifyInit(JNIEnv* env, jobject thiz,
+                                                                          jlong jSession,
+                                                                          jobject jMechanism,
+                                                                          jlong jKey) {
     initWithKey(env, thiz, __func__, jSession, jMechanism, jKey,
                 [](CK_FUNCTION_LIST_PTR f) { return f->C_VerifyInit; });
 }
 
-VOK_PKCS11_METHOD(void, C_1VerifyRecoverInit)(JNIEnv* env, jobject thiz, jlong jSession,
-                                              jobject jMechanism, jlong jKey) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1VerifyRecoverInit(
+    JNIEnv* env, jobject thiz, jlong jSession, jobject jMechanism, jlong jKey) {
     initWithKey(env, thiz, __func__, jSession, jMechanism, jKey,
                 [](CK_FUNCTION_LIST_PTR f) { return f->C_VerifyRecoverInit; });
 }
 
-VOK_PKCS11_METHOD(void, C_1DigestInit)(JNIEnv* env, jobject thiz, jlong jSession,
-                                       jobject jMechanism) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1DigestInit(JNIEnv* env, jobject thiz,
+                                                                          jlong jSession,
+                                                                          jobject jMechanism) {
     nativeMethod<void>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         NativeMechanism mechanism;
         if (!mechanism.from(env, jMechanism)) return;
@@ -131,8 +137,10 @@ VOK_PKCS11_METHOD(void, C_1DigestInit)(JNIEnv* env, jobject thiz, jlong jSession
 
 // ---- Single-part calls ---------------------------------------------------------
 
-VOK_PKCS11_METHOD(jbyteArray, C_1Encrypt)(JNIEnv* env, jobject thiz, jlong jSession,
-                                          jbyteArray jData) {
+VOK_C_API jbyteArray JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1Encrypt(JNIEnv* env,
+                                                                             jobject thiz,
+                                                                             jlong jSession,
+                                                                             jbyteArray jData) {
     return nativeMethod<jbyteArray>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         NativeBytes data;
         OutputBuffer<CK_BYTE> encrypted;
@@ -145,8 +153,8 @@ VOK_PKCS11_METHOD(jbyteArray, C_1Encrypt)(JNIEnv* env, jobject thiz, jlong jSess
     });
 }
 
-VOK_PKCS11_METHOD(jbyteArray, C_1Decrypt)(JNIEnv* env, jobject thiz, jlong jSession,
-                                          jbyteArray jEncryptedData) {
+VOK_C_API jbyteArray JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1Decrypt(
+    JNIEnv* env, jobject thiz, jlong jSession, jbyteArray jEncryptedData) {
     return nativeMethod<jbyteArray>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         NativeBytes encrypted;
         if (!encrypted.from(env, jEncryptedData)) return jbyteArray(nullptr);
@@ -161,8 +169,10 @@ VOK_PKCS11_METHOD(jbyteArray, C_1Decrypt)(JNIEnv* env, jobject thiz, jlong jSess
     });
 }
 
-VOK_PKCS11_METHOD(jbyteArray, C_1Digest)(JNIEnv* env, jobject thiz, jlong jSession,
-                                         jbyteArray jData) {
+VOK_C_API jbyteArray JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1Digest(JNIEnv* env,
+                                                                            jobject thiz,
+                                                                            jlong jSession,
+                                                                            jbyteArray jData) {
     MethodRules rules;
     rules.nameTag = "%s";  // the name line's tag has always been the format; kept
     return nativeMethod<jbyteArray>(
@@ -187,8 +197,9 @@ VOK_PKCS11_METHOD(jbyteArray, C_1Digest)(JNIEnv* env, jobject thiz, jlong jSessi
         rules);
 }
 
-VOK_PKCS11_METHOD(jbyteArray, C_1Sign)(JNIEnv* env, jobject thiz, jlong jSession,
-                                       jbyteArray jData) {
+VOK_C_API jbyteArray JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1Sign(JNIEnv* env, jobject thiz,
+                                                                          jlong jSession,
+                                                                          jbyteArray jData) {
     return nativeMethod<jbyteArray>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         NativeBytes data;
         OutputBuffer<CK_BYTE> signature;
@@ -209,112 +220,132 @@ VOK_PKCS11_METHOD(jbyteArray, C_1Sign)(JNIEnv* env, jobject thiz, jlong jSession
     });
 }
 
-VOK_PKCS11_METHOD(void, C_1Verify)(JNIEnv* env, jobject thiz, jlong jSession, jbyteArray jData,
-                                   jbyteArray jSignature) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1Verify(JNIEnv* env, jobject thiz,
+                                                                      jlong jSession,
+                                                                      jbyteArray jData,
+                                                                      jbyteArray jSignature) {
     nativeMethod<void>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         NativeBytes data, signature;
         if (!data.from(env, jData) || !signature.from(env, jSignature)) return;
-        resultOf(env, callModule(f->C_Verify, static_cast<CK_SESSION_HANDLE>(jSession),
-                                 data.data(), data.length(), signature.data(),
-                                 signature.length()));
+        resultOf(env, callModule(f->C_Verify, static_cast<CK_SESSION_HANDLE>(jSession), data.data(),
+                                 data.length(), signature.data(), signature.length()));
     });
 }
 
 // ---- Multi-part calls ----------------------------------------------------------
 
-VOK_PKCS11_METHOD(jbyteArray, C_1EncryptUpdate)(JNIEnv* env, jobject thiz, jlong jSession,
-                                                jbyteArray jPart) {
+VOK_C_API jbyteArray JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1EncryptUpdate(
+    JNIEnv* env, jobject thiz, jlong jSession, jbyteArray jPart) {
     return transformed(env, thiz, __func__, jSession, jPart,
                        [](CK_FUNCTION_LIST_PTR f) { return f->C_EncryptUpdate; });
 }
 
-VOK_PKCS11_METHOD(jbyteArray, C_1DecryptUpdate)(JNIEnv* env, jobject thiz, jlong jSession,
-                                                jbyteArray jEncryptedPart) {
+VOK_C_API jbyteArray JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1DecryptUpdate(
+    JNIEnv* env, jobject thiz, jlong jSession, jbyteArray jEncryptedPart) {
     return transformed(env, thiz, __func__, jSession, jEncryptedPart,
                        [](CK_FUNCTION_LIST_PTR f) { return f->C_DecryptUpdate; });
 }
 
-VOK_PKCS11_METHOD(jbyteArray, C_1SignRecover)(JNIEnv* env, jobject thiz, jlong jSession,
-                                              jbyteArray jData) {
+VOK_C_API jbyteArray JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1SignRecover(JNIEnv* env,
+                                                                                 jobject thiz,
+                                                                                 jlong jSession,
+                                                                                 jbyteArray jData) {
     return transformed(env, thiz, __func__, jSession, jData,
                        [](CK_FUNCTION_LIST_PTR f) { return f->C_SignRecover; });
 }
 
-VOK_PKCS11_METHOD(jbyteArray, C_1VerifyRecover)(JNIEnv* env, jobject thiz, jlong jSession,
-                                                jbyteArray jSignature) {
+VOK_C_API jbyteArray JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1VerifyRecover(
+    JNIEnv* env, jobject thiz, jlong jSession, jbyteArray jSignature) {
     return transformed(env, thiz, __func__, jSession, jSignature,
                        [](CK_FUNCTION_LIST_PTR f) { return f->C_VerifyRecover; });
 }
 
-VOK_PKCS11_METHOD(jbyteArray, C_1DigestEncryptUpdate)(JNIEnv* env, jobject thiz, jlong jSession,
-                                                      jbyteArray jPart) {
+VOK_C_API jbyteArray JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1DigestEncryptUpdate(
+    JNIEnv* env, jobject thiz, jlong jSession, jbyteArray jPart) {
     return transformed(env, thiz, __func__, jSession, jPart,
                        [](CK_FUNCTION_LIST_PTR f) { return f->C_DigestEncryptUpdate; });
 }
 
-VOK_PKCS11_METHOD(jbyteArray, C_1DecryptDigestUpdate)(JNIEnv* env, jobject thiz, jlong jSession,
-                                                      jbyteArray jEncryptedPart) {
+VOK_C_API jbyteArray JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1DecryptDigestUpdate(
+    JNIEnv* env, jobject thiz, jlong jSession, jbyteArray jEncryptedPart) {
     return transformed(env, thiz, __func__, jSession, jEncryptedPart,
                        [](CK_FUNCTION_LIST_PTR f) { return f->C_DecryptDigestUpdate; });
 }
 
-VOK_PKCS11_METHOD(jbyteArray, C_1SignEncryptUpdate)(JNIEnv* env, jobject thiz, jlong jSession,
-                                                    jbyteArray jPart) {
+VOK_C_API jbyteArray JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1SignEncryptUpdate(
+    JNIEnv* env, jobject thiz, jlong jSession, jbyteArray jPart) {
     return transformed(env, thiz, __func__, jSession, jPart,
                        [](CK_FUNCTION_LIST_PTR f) { return f->C_SignEncryptUpdate; });
 }
 
-VOK_PKCS11_METHOD(jbyteArray, C_1DecryptVerifyUpdate)(JNIEnv* env, jobject thiz, jlong jSession,
-                                                      jbyteArray jEncryptedPart) {
+VOK_C_API jbyteArray JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1DecryptVerifyUpdate(
+    JNIEnv* env, jobject thiz, jlong jSession, jbyteArray jEncryptedPart) {
     return transformed(env, thiz, __func__, jSession, jEncryptedPart,
                        [](CK_FUNCTION_LIST_PTR f) { return f->C_DecryptVerifyUpdate; });
 }
 
-VOK_PKCS11_METHOD(jbyteArray, C_1EncryptFinal)(JNIEnv* env, jobject thiz, jlong jSession) {
+VOK_C_API jbyteArray JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1EncryptFinal(JNIEnv* env,
+                                                                                  jobject thiz,
+                                                                                  jlong jSession) {
     return finalOutput(env, thiz, __func__, jSession,
                        [](CK_FUNCTION_LIST_PTR f) { return f->C_EncryptFinal; });
 }
 
-VOK_PKCS11_METHOD(jbyteArray, C_1DecryptFinal)(JNIEnv* env, jobject thiz, jlong jSession) {
+VOK_C_API jbyteArray JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1DecryptFinal(JNIEnv* env,
+                                                                                  jobject thiz,
+                                                                                  jlong jSession) {
     return finalOutput(env, thiz, __func__, jSession,
                        [](CK_FUNCTION_LIST_PTR f) { return f->C_DecryptFinal; });
 }
 
-VOK_PKCS11_METHOD(jbyteArray, C_1DigestFinal)(JNIEnv* env, jobject thiz, jlong jSession) {
+VOK_C_API jbyteArray JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1DigestFinal(JNIEnv* env,
+                                                                                 jobject thiz,
+                                                                                 jlong jSession) {
     return finalOutput(env, thiz, __func__, jSession,
                        [](CK_FUNCTION_LIST_PTR f) { return f->C_DigestFinal; });
 }
 
-VOK_PKCS11_METHOD(jbyteArray, C_1SignFinal)(JNIEnv* env, jobject thiz, jlong jSession) {
+VOK_C_API jbyteArray JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1SignFinal(JNIEnv* env,
+                                                                               jobject thiz,
+                                                                               jlong jSession) {
     return finalOutput(env, thiz, __func__, jSession,
                        [](CK_FUNCTION_LIST_PTR f) { return f->C_SignFinal; });
 }
 
-VOK_PKCS11_METHOD(void, C_1DigestUpdate)(JNIEnv* env, jobject thiz, jlong jSession,
-                                         jbyteArray jPart) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1DigestUpdate(JNIEnv* env,
+                                                                            jobject thiz,
+                                                                            jlong jSession,
+                                                                            jbyteArray jPart) {
     inputOnly(env, thiz, __func__, jSession, jPart,
               [](CK_FUNCTION_LIST_PTR f) { return f->C_DigestUpdate; });
 }
 
-VOK_PKCS11_METHOD(void, C_1SignUpdate)(JNIEnv* env, jobject thiz, jlong jSession,
-                                       jbyteArray jPart) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1SignUpdate(JNIEnv* env, jobject thiz,
+                                                                          jlong jSession,
+                                                                          jbyteArray jPart) {
     inputOnly(env, thiz, __func__, jSession, jPart,
               [](CK_FUNCTION_LIST_PTR f) { return f->C_SignUpdate; });
 }
 
-VOK_PKCS11_METHOD(void, C_1VerifyUpdate)(JNIEnv* env, jobject thiz, jlong jSession,
-                                         jbyteArray jPart) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1VerifyUpdate(JNIEnv* env,
+                                                                            jobject thiz,
+                                                                            jlong jSession,
+                                                                            jbyteArray jPart) {
     inputOnly(env, thiz, __func__, jSession, jPart,
               [](CK_FUNCTION_LIST_PTR f) { return f->C_VerifyUpdate; });
 }
 
-VOK_PKCS11_METHOD(void, C_1VerifyFinal)(JNIEnv* env, jobject thiz, jlong jSession,
-                                        jbyteArray jSignature) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1VerifyFinal(JNIEnv* env,
+                                                                           jobject thiz,
+                                                                           jlong jSession,
+                                                                           jbyteArray jSignature) {
     inputOnly(env, thiz, __func__, jSession, jSignature,
               [](CK_FUNCTION_LIST_PTR f) { return f->C_VerifyFinal; });
 }
 
-VOK_PKCS11_METHOD(void, C_1DigestKey)(JNIEnv* env, jobject thiz, jlong jSession, jlong jKey) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1DigestKey(JNIEnv* env, jobject thiz,
+                                                                         jlong jSession,
+                                                                         jlong jKey) {
     nativeMethod<void>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         resultOf(env, callModule(f->C_DigestKey, static_cast<CK_SESSION_HANDLE>(jSession),
                                  static_cast<CK_OBJECT_HANDLE>(jKey)));

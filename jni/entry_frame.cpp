@@ -5,6 +5,7 @@
 
 #include "java_objects.h"
 #include "registry.h"
+#include "vok_export.h"
 #include "vok_log.h"
 
 namespace vokjni {

@@ -28,10 +28,10 @@ constexpr const char* kJniTag = "[native jni pkcs11wrapper]";
 
 // How a method's start differs from the common one.
 struct MethodRules {
-    const char* nameTag = kJniTag;     // the tag of the line that logs the method's name
-    const char* afterName = nullptr;   // a line logged right after the name
-    int missingEntryLines = 0;         // "failed getting module entry" lines before the throw
-    bool listMayBeMissing = false;     // the body runs (with null) for an entry without a list
+    const char* nameTag = kJniTag;    // the tag of the line that logs the method's name
+    const char* afterName = nullptr;  // a line logged right after the name
+    int missingEntryLines = 0;        // "failed getting module entry" lines before the throw
+    bool listMayBeMissing = false;    // the body runs (with null) for an entry without a list
 };
 
 // The module registered for `thiz`, or null with an exception pending: the
@@ -235,10 +235,5 @@ inline jbyteArray bytesOf(JNIEnv* env, CK_RV rv, const OutputBuffer<CK_BYTE>& ou
 std::string boundedText(const void* bytes, CK_ULONG length);
 
 }  // namespace vokjni
-
-// Definitions of the native methods: C linkage, exported, the JNI name of C_X.
-#define VOK_PKCS11_METHOD(result, name) \
-    extern "C" __attribute__((visibility("default"))) result JNICALL \
-        Java_com_vok_smartcard_pkcs11_Pkcs11_##name
 
 #endif

@@ -4,6 +4,7 @@
 #include <cstring>
 
 #include "entry_frame.h"
+#include "vok_export.h"
 #include "vok_log.h"
 
 using namespace vokjni;
@@ -39,7 +40,8 @@ jlongArray listOf(JNIEnv* env, Call call) {
 
 }  // namespace
 
-VOK_PKCS11_METHOD(void, C_1Initialize)(JNIEnv* env, jobject thiz, jobject jInitArgs) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1Initialize(JNIEnv* env, jobject thiz,
+                                                                          jobject jInitArgs) {
     MethodRules rules;
     rules.afterName = "DEBUG: initializing module... ";
     rules.missingEntryLines = 2;
@@ -69,14 +71,16 @@ VOK_PKCS11_METHOD(void, C_1Initialize)(JNIEnv* env, jobject thiz, jobject jInitA
         rules);
 }
 
-VOK_PKCS11_METHOD(void, C_1Finalize)(JNIEnv* env, jobject thiz, jlong jReserved) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1Finalize(JNIEnv* env, jobject thiz,
+                                                                        jlong jReserved) {
     nativeMethod<void>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         // The Java value is the reserved pointer itself.
         resultOf(env, callModule(f->C_Finalize, reinterpret_cast<CK_VOID_PTR>(jReserved)));
     });
 }
 
-VOK_PKCS11_METHOD(jobject, C_1GetInfo)(JNIEnv* env, jobject thiz) {
+VOK_C_API jobject JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1GetInfo(JNIEnv* env,
+                                                                          jobject thiz) {
     return nativeMethod<jobject>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         CK_INFO info{};
         CK_RV rv = callModule(f->C_GetInfo, &info);
@@ -84,7 +88,8 @@ VOK_PKCS11_METHOD(jobject, C_1GetInfo)(JNIEnv* env, jobject thiz) {
     });
 }
 
-VOK_PKCS11_METHOD(jlongArray, C_1GetSlotList)(JNIEnv* env, jobject thiz, jboolean jTokenPresent) {
+VOK_C_API jlongArray JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1GetSlotList(
+    JNIEnv* env, jobject thiz, jboolean jTokenPresent) {
     return nativeMethod<jlongArray>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         const CK_BBOOL present = jTokenPresent == JNI_TRUE ? CK_TRUE : CK_FALSE;
         return listOf(env, [&](CK_SLOT_ID_PTR list, CK_ULONG_PTR count) {
@@ -93,7 +98,9 @@ VOK_PKCS11_METHOD(jlongArray, C_1GetSlotList)(JNIEnv* env, jobject thiz, jboolea
     });
 }
 
-VOK_PKCS11_METHOD(jobject, C_1GetSlotInfo)(JNIEnv* env, jobject thiz, jlong jSlotID) {
+VOK_C_API jobject JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1GetSlotInfo(JNIEnv* env,
+                                                                              jobject thiz,
+                                                                              jlong jSlotID) {
     return nativeMethod<jobject>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         CK_SLOT_INFO info{};
         CK_RV rv = callModule(f->C_GetSlotInfo, static_cast<CK_SLOT_ID>(jSlotID), &info);
@@ -101,7 +108,9 @@ VOK_PKCS11_METHOD(jobject, C_1GetSlotInfo)(JNIEnv* env, jobject thiz, jlong jSlo
     });
 }
 
-VOK_PKCS11_METHOD(jobject, C_1GetTokenInfo)(JNIEnv* env, jobject thiz, jlong jSlotID) {
+VOK_C_API jobject JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1GetTokenInfo(JNIEnv* env,
+                                                                               jobject thiz,
+                                                                               jlong jSlotID) {
     return nativeMethod<jobject>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         CK_TOKEN_INFO info{};
         CK_RV rv = callModule(f->C_GetTokenInfo, static_cast<CK_SLOT_ID>(jSlotID), &info);
@@ -109,17 +118,19 @@ VOK_PKCS11_METHOD(jobject, C_1GetTokenInfo)(JNIEnv* env, jobject thiz, jlong jSl
     });
 }
 
-VOK_PKCS11_METHOD(jlongArray, C_1GetMechanismList)(JNIEnv* env, jobject thiz, jlong jSlotID) {
+VOK_C_API jlongArray JNICALL
+Java_com_vok_smartcard_pkcs11_Pkcs11_C_1GetMechanismList(JNIEnv* env, jobject thiz, jlong jSlotID) {
     return nativeMethod<jlongArray>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         return listOf(env, [&](CK_MECHANISM_TYPE_PTR list, CK_ULONG_PTR count) {
-            return callModule(f->C_GetMechanismList, static_cast<CK_SLOT_ID>(jSlotID), list,
-                              count);
+            return callModule(f->C_GetMechanismList, static_cast<CK_SLOT_ID>(jSlotID), list, count);
         });
     });
 }
 
-VOK_PKCS11_METHOD(jobject, C_1GetMechanismInfo)(JNIEnv* env, jobject thiz, jlong jSlotID,
-                                                jlong jType) {
+VOK_C_API jobject JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1GetMechanismInfo(JNIEnv* env,
+                                                                                   jobject thiz,
+                                                                                   jlong jSlotID,
+                                                                                   jlong jType) {
     return nativeMethod<jobject>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         CK_MECHANISM_INFO info{};
         CK_RV rv = callModule(f->C_GetMechanismInfo, static_cast<CK_SLOT_ID>(jSlotID),
@@ -128,8 +139,10 @@ VOK_PKCS11_METHOD(jobject, C_1GetMechanismInfo)(JNIEnv* env, jobject thiz, jlong
     });
 }
 
-VOK_PKCS11_METHOD(void, C_1InitToken)(JNIEnv* env, jobject thiz, jlong jSlotID, jcharArray jPin,
-                                      jcharArray jLabel) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1InitToken(JNIEnv* env, jobject thiz,
+                                                                         jlong jSlotID,
+                                                                         jcharArray jPin,
+                                                                         jcharArray jLabel) {
     nativeMethod<void>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         NativeBytes pin, label;
         if (!pin.from(env, jPin) || !label.from(env, jLabel) || !padLabel(env, label)) return;
@@ -140,17 +153,21 @@ VOK_PKCS11_METHOD(void, C_1InitToken)(JNIEnv* env, jobject thiz, jlong jSlotID, 
     });
 }
 
-VOK_PKCS11_METHOD(void, C_1InitPIN)(JNIEnv* env, jobject thiz, jlong jSession, jcharArray jPin) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1InitPIN(JNIEnv* env, jobject thiz,
+                                                                       jlong jSession,
+                                                                       jcharArray jPin) {
     nativeMethod<void>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         NativeBytes pin;
         if (!pin.from(env, jPin)) return;
-        resultOf(env, callModule(f->C_InitPIN, static_cast<CK_SESSION_HANDLE>(jSession),
-                                 pin.data(), pin.length()));
+        resultOf(env, callModule(f->C_InitPIN, static_cast<CK_SESSION_HANDLE>(jSession), pin.data(),
+                                 pin.length()));
     });
 }
 
-VOK_PKCS11_METHOD(void, C_1SetPIN)(JNIEnv* env, jobject thiz, jlong jSession, jcharArray jOldPin,
-                                   jcharArray jNewPin) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1SetPIN(JNIEnv* env, jobject thiz,
+                                                                      jlong jSession,
+                                                                      jcharArray jOldPin,
+                                                                      jcharArray jNewPin) {
     nativeMethod<void>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         NativeBytes oldPin, newPin;
         if (!oldPin.from(env, jOldPin) || !newPin.from(env, jNewPin)) return;
@@ -159,8 +176,10 @@ VOK_PKCS11_METHOD(void, C_1SetPIN)(JNIEnv* env, jobject thiz, jlong jSession, jc
     });
 }
 
-VOK_PKCS11_METHOD(jlong, C_1WaitForSlotEvent)(JNIEnv* env, jobject thiz, jlong jFlags,
-                                              jlong jReserved) {
+VOK_C_API jlong JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1WaitForSlotEvent(JNIEnv* env,
+                                                                                 jobject thiz,
+                                                                                 jlong jFlags,
+                                                                                 jlong jReserved) {
     return nativeMethod<jlong>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         CK_SLOT_ID slot = 0;
         CK_RV rv = callModule(f->C_WaitForSlotEvent, static_cast<CK_FLAGS>(jFlags), &slot,

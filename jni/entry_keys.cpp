@@ -3,12 +3,13 @@
 
 #define LOG_TAG "[native jni pkcs11wrapper]"
 #include "entry_frame.h"
+#include "vok_export.h"
 #include "vok_log.h"
 
 using namespace vokjni;
 
-VOK_PKCS11_METHOD(jlong, C_1GenerateKey)(JNIEnv* env, jobject thiz, jlong jSession,
-                                         jobject jMechanism, jobjectArray jTemplate) {
+VOK_C_API jlong JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1GenerateKey(
+    JNIEnv* env, jobject thiz, jlong jSession, jobject jMechanism, jobjectArray jTemplate) {
     return nativeMethod<jlong>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         NativeMechanism mechanism;
         NativeTemplate attributes;
@@ -22,10 +23,9 @@ VOK_PKCS11_METHOD(jlong, C_1GenerateKey)(JNIEnv* env, jobject thiz, jlong jSessi
     });
 }
 
-VOK_PKCS11_METHOD(jlongArray, C_1GenerateKeyPair)(JNIEnv* env, jobject thiz, jlong jSession,
-                                                  jobject jMechanism,
-                                                  jobjectArray jPublicKeyTemplate,
-                                                  jobjectArray jPrivateKeyTemplate) {
+VOK_C_API jlongArray JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1GenerateKeyPair(
+    JNIEnv* env, jobject thiz, jlong jSession, jobject jMechanism, jobjectArray jPublicKeyTemplate,
+    jobjectArray jPrivateKeyTemplate) {
     return nativeMethod<jlongArray>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         NativeMechanism mechanism;
         NativeTemplate publicTemplate, privateTemplate;
@@ -40,8 +40,8 @@ VOK_PKCS11_METHOD(jlongArray, C_1GenerateKeyPair)(JNIEnv* env, jobject thiz, jlo
     });
 }
 
-VOK_PKCS11_METHOD(jbyteArray, C_1WrapKey)(JNIEnv* env, jobject thiz, jlong jSession,
-                                          jobject jMechanism, jlong jWrappingKey, jlong jKey) {
+VOK_C_API jbyteArray JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1WrapKey(
+    JNIEnv* env, jobject thiz, jlong jSession, jobject jMechanism, jlong jWrappingKey, jlong jKey) {
     return nativeMethod<jbyteArray>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         NativeMechanism mechanism;
         if (!mechanism.from(env, jMechanism)) return jbyteArray(nullptr);
@@ -56,9 +56,9 @@ VOK_PKCS11_METHOD(jbyteArray, C_1WrapKey)(JNIEnv* env, jobject thiz, jlong jSess
     });
 }
 
-VOK_PKCS11_METHOD(jlong, C_1UnwrapKey)(JNIEnv* env, jobject thiz, jlong jSession,
-                                       jobject jMechanism, jlong jUnwrappingKey,
-                                       jbyteArray jWrappedKey, jobjectArray jTemplate) {
+VOK_C_API jlong JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1UnwrapKey(
+    JNIEnv* env, jobject thiz, jlong jSession, jobject jMechanism, jlong jUnwrappingKey,
+    jbyteArray jWrappedKey, jobjectArray jTemplate) {
     return nativeMethod<jlong>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         NativeMechanism mechanism;
         NativeBytes wrapped;
@@ -67,18 +67,20 @@ VOK_PKCS11_METHOD(jlong, C_1UnwrapKey)(JNIEnv* env, jobject thiz, jlong jSession
             !attributes.from(env, jTemplate))
             return jlong(0);
         CK_OBJECT_HANDLE key = CK_INVALID_HANDLE;
-        CK_RV rv = callModule(f->C_UnwrapKey, static_cast<CK_SESSION_HANDLE>(jSession),
-                              mechanism.get(), static_cast<CK_OBJECT_HANDLE>(jUnwrappingKey),
-                              wrapped.data(), wrapped.length(), attributes.data(),
-                              attributes.count(), &key);
+        CK_RV rv =
+            callModule(f->C_UnwrapKey, static_cast<CK_SESSION_HANDLE>(jSession), mechanism.get(),
+                       static_cast<CK_OBJECT_HANDLE>(jUnwrappingKey), wrapped.data(),
+                       wrapped.length(), attributes.data(), attributes.count(), &key);
         copyBackSetUnwrappedKey(env, mechanism.get(), jMechanism);
         return resultOf(env, rv, [&] { return static_cast<jlong>(key); });
     });
 }
 
-VOK_PKCS11_METHOD(jlong, C_1DeriveKey)(JNIEnv* env, jobject thiz, jlong jSession,
-                                       jobject jMechanism, jlong jBaseKey,
-                                       jobjectArray jTemplate) {
+VOK_C_API jlong JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1DeriveKey(JNIEnv* env, jobject thiz,
+                                                                          jlong jSession,
+                                                                          jobject jMechanism,
+                                                                          jlong jBaseKey,
+                                                                          jobjectArray jTemplate) {
     return nativeMethod<jlong>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         NativeMechanism mechanism;
         NativeTemplate attributes;
@@ -93,8 +95,9 @@ VOK_PKCS11_METHOD(jlong, C_1DeriveKey)(JNIEnv* env, jobject thiz, jlong jSession
     });
 }
 
-VOK_PKCS11_METHOD(void, C_1SeedRandom)(JNIEnv* env, jobject thiz, jlong jSession,
-                                       jbyteArray jSeed) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1SeedRandom(JNIEnv* env, jobject thiz,
+                                                                          jlong jSession,
+                                                                          jbyteArray jSeed) {
     nativeMethod<void>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         NativeBytes seed;
         if (!seed.from(env, jSeed)) return;
@@ -103,8 +106,8 @@ VOK_PKCS11_METHOD(void, C_1SeedRandom)(JNIEnv* env, jobject thiz, jlong jSession
     });
 }
 
-VOK_PKCS11_METHOD(void, C_1GenerateRandom)(JNIEnv* env, jobject thiz, jlong jSession,
-                                           jbyteArray jRandomData) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1GenerateRandom(
+    JNIEnv* env, jobject thiz, jlong jSession, jbyteArray jRandomData) {
     nativeMethod<void>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         const jsize size = jRandomData != nullptr ? env->GetArrayLength(jRandomData) : 0;
         VOK_LOGD("jRandomDataSize: %ld ", static_cast<long>(size));

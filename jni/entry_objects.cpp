@@ -7,6 +7,7 @@
 
 #include "entry_frame.h"
 #include "java_objects.h"
+#include "vok_export.h"
 #include "vok_log.h"
 
 using namespace vokjni;
@@ -135,11 +136,11 @@ private:
             if (inner[j].pValue != lent) inner[j].pValue = nullptr;
             if (inner[j].pValue != nullptr && isTemplateType(inner[j].type)) {
                 const CK_ULONG capacity = nested_[i][j].capacity;
-                CK_ULONG deeper = (isUnavailable(inner[j].ulValueLen) ||
-                                   inner[j].ulValueLen > capacity
-                                       ? capacity
-                                       : inner[j].ulValueLen) /
-                                  sizeof(CK_ATTRIBUTE);
+                CK_ULONG deeper =
+                    (isUnavailable(inner[j].ulValueLen) || inner[j].ulValueLen > capacity
+                         ? capacity
+                         : inner[j].ulValueLen) /
+                    sizeof(CK_ATTRIBUTE);
                 auto* deepest = static_cast<CK_ATTRIBUTE_PTR>(inner[j].pValue);
                 for (CK_ULONG k = 0; k < deeper; ++k) deepest[k].pValue = nullptr;
             }
@@ -163,8 +164,8 @@ void replaceElements(JNIEnv* env, jobjectArray jTemplate, const NativeTemplate& 
 
 }  // namespace
 
-VOK_PKCS11_METHOD(jlong, C_1CreateObject)(JNIEnv* env, jobject thiz, jlong jSession,
-                                          jobjectArray jTemplate) {
+VOK_C_API jlong JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1CreateObject(
+    JNIEnv* env, jobject thiz, jlong jSession, jobjectArray jTemplate) {
     return nativeMethod<jlong>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         NativeTemplate attributes;
         if (!attributes.from(env, jTemplate)) return jlong(0);
@@ -175,8 +176,8 @@ VOK_PKCS11_METHOD(jlong, C_1CreateObject)(JNIEnv* env, jobject thiz, jlong jSess
     });
 }
 
-VOK_PKCS11_METHOD(jlong, C_1CopyObject)(JNIEnv* env, jobject thiz, jlong jSession, jlong jObject,
-                                        jobjectArray jTemplate) {
+VOK_C_API jlong JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1CopyObject(
+    JNIEnv* env, jobject thiz, jlong jSession, jlong jObject, jobjectArray jTemplate) {
     return nativeMethod<jlong>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         NativeTemplate attributes;
         if (!attributes.from(env, jTemplate)) return jlong(0);
@@ -188,16 +189,20 @@ VOK_PKCS11_METHOD(jlong, C_1CopyObject)(JNIEnv* env, jobject thiz, jlong jSessio
     });
 }
 
-VOK_PKCS11_METHOD(void, C_1DestroyObject)(JNIEnv* env, jobject thiz, jlong jSession,
-                                          jlong jObject) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1DestroyObject(JNIEnv* env,
+                                                                             jobject thiz,
+                                                                             jlong jSession,
+                                                                             jlong jObject) {
     nativeMethod<void>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         resultOf(env, callModule(f->C_DestroyObject, static_cast<CK_SESSION_HANDLE>(jSession),
                                  static_cast<CK_OBJECT_HANDLE>(jObject)));
     });
 }
 
-VOK_PKCS11_METHOD(jlong, C_1GetObjectSize)(JNIEnv* env, jobject thiz, jlong jSession,
-                                           jlong jObject) {
+VOK_C_API jlong JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1GetObjectSize(JNIEnv* env,
+                                                                              jobject thiz,
+                                                                              jlong jSession,
+                                                                              jlong jObject) {
     return nativeMethod<jlong>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         CK_ULONG size = 0;
         CK_RV rv = callModule(f->C_GetObjectSize, static_cast<CK_SESSION_HANDLE>(jSession),
@@ -208,8 +213,8 @@ VOK_PKCS11_METHOD(jlong, C_1GetObjectSize)(JNIEnv* env, jobject thiz, jlong jSes
 
 // Up to three module calls: the lengths, the values, and the values inside
 // template attributes once their lengths are known.
-VOK_PKCS11_METHOD(void, C_1GetAttributeValue)(JNIEnv* env, jobject thiz, jlong jSession,
-                                              jlong jObject, jobjectArray jTemplate) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1GetAttributeValue(
+    JNIEnv* env, jobject thiz, jlong jSession, jlong jObject, jobjectArray jTemplate) {
     nativeMethod<void>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         VOK_LOGD("DEBUG: C_GetAttributeValue");
         VOK_LOGD(", hSession=%u", static_cast<unsigned>(jSession));
@@ -243,8 +248,8 @@ VOK_PKCS11_METHOD(void, C_1GetAttributeValue)(JNIEnv* env, jobject thiz, jlong j
     });
 }
 
-VOK_PKCS11_METHOD(void, C_1SetAttributeValue)(JNIEnv* env, jobject thiz, jlong jSession,
-                                              jlong jObject, jobjectArray jTemplate) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1SetAttributeValue(
+    JNIEnv* env, jobject thiz, jlong jSession, jlong jObject, jobjectArray jTemplate) {
     nativeMethod<void>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         NativeTemplate attributes;
         if (!attributes.from(env, jTemplate)) return;
@@ -254,8 +259,8 @@ VOK_PKCS11_METHOD(void, C_1SetAttributeValue)(JNIEnv* env, jobject thiz, jlong j
     });
 }
 
-VOK_PKCS11_METHOD(void, C_1FindObjectsInit)(JNIEnv* env, jobject thiz, jlong jSession,
-                                            jobjectArray jTemplate) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1FindObjectsInit(
+    JNIEnv* env, jobject thiz, jlong jSession, jobjectArray jTemplate) {
     nativeMethod<void>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         VOK_LOGD("DEBUG: C_FindObjectsInit");
         VOK_LOGD(", hSession=%ld", static_cast<long>(jSession));
@@ -272,8 +277,8 @@ VOK_PKCS11_METHOD(void, C_1FindObjectsInit)(JNIEnv* env, jobject thiz, jlong jSe
     });
 }
 
-VOK_PKCS11_METHOD(jlongArray, C_1FindObjects)(JNIEnv* env, jobject thiz, jlong jSession,
-                                              jlong jMaxObjectCount) {
+VOK_C_API jlongArray JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1FindObjects(
+    JNIEnv* env, jobject thiz, jlong jSession, jlong jMaxObjectCount) {
     return nativeMethod<jlongArray>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         const auto maxCount = static_cast<CK_ULONG>(jMaxObjectCount);
         VOK_LOGD(" ckMaxObjectLength:%llu", static_cast<unsigned long long>(maxCount));
@@ -289,7 +294,9 @@ VOK_PKCS11_METHOD(jlongArray, C_1FindObjects)(JNIEnv* env, jobject thiz, jlong j
     });
 }
 
-VOK_PKCS11_METHOD(void, C_1FindObjectsFinal)(JNIEnv* env, jobject thiz, jlong jSession) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1FindObjectsFinal(JNIEnv* env,
+                                                                                jobject thiz,
+                                                                                jlong jSession) {
     nativeMethod<void>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         resultOf(env, callModule(f->C_FindObjectsFinal, static_cast<CK_SESSION_HANDLE>(jSession)));
     });

@@ -3,12 +3,13 @@
 
 #define LOG_TAG "[native jni pkcs11wrapper]"
 #include "entry_frame.h"
+#include "vok_export.h"
 #include "vok_log.h"
 
 using namespace vokjni;
 
-VOK_PKCS11_METHOD(jlong, C_1OpenSession)(JNIEnv* env, jobject thiz, jlong jSlotID, jlong jFlags,
-                                         jobject /*jApplication*/) {
+VOK_C_API jlong JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1OpenSession(
+    JNIEnv* env, jobject thiz, jlong jSlotID, jlong jFlags, jobject /*jApplication*/) {
     return nativeMethod<jlong>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         VOK_LOGD("DEBUG: C_OpenSession");
         VOK_LOGD(", slotID=%llu", static_cast<unsigned long long>(jSlotID));
@@ -26,42 +27,48 @@ VOK_PKCS11_METHOD(jlong, C_1OpenSession)(JNIEnv* env, jobject thiz, jlong jSlotI
     });
 }
 
-VOK_PKCS11_METHOD(void, C_1CloseSession)(JNIEnv* env, jobject thiz, jlong jSession) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1CloseSession(JNIEnv* env,
+                                                                            jobject thiz,
+                                                                            jlong jSession) {
     nativeMethod<void>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         resultOf(env, callModule(f->C_CloseSession, static_cast<CK_SESSION_HANDLE>(jSession)));
     });
 }
 
-VOK_PKCS11_METHOD(void, C_1CloseAllSessions)(JNIEnv* env, jobject thiz, jlong jSlotID) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1CloseAllSessions(JNIEnv* env,
+                                                                                jobject thiz,
+                                                                                jlong jSlotID) {
     nativeMethod<void>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         resultOf(env, callModule(f->C_CloseAllSessions, static_cast<CK_SLOT_ID>(jSlotID)));
     });
 }
 
-VOK_PKCS11_METHOD(jobject, C_1GetSessionInfo)(JNIEnv* env, jobject thiz, jlong jSession) {
+VOK_C_API jobject JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1GetSessionInfo(JNIEnv* env,
+                                                                                 jobject thiz,
+                                                                                 jlong jSession) {
     return nativeMethod<jobject>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         CK_SESSION_INFO info{};
-        CK_RV rv =
-            callModule(f->C_GetSessionInfo, static_cast<CK_SESSION_HANDLE>(jSession), &info);
+        CK_RV rv = callModule(f->C_GetSessionInfo, static_cast<CK_SESSION_HANDLE>(jSession), &info);
         return resultOf(env, rv, [&] { return ckSessionInfoPtrToJSessionInfo(env, &info); });
     });
 }
 
-VOK_PKCS11_METHOD(jbyteArray, C_1GetOperationState)(JNIEnv* env, jobject thiz, jlong jSession) {
+VOK_C_API jbyteArray JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1GetOperationState(
+    JNIEnv* env, jobject thiz, jlong jSession) {
     return nativeMethod<jbyteArray>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         OutputBuffer<CK_BYTE> state;
         CK_ULONG length = 0;
         CK_RV rv = queryThenFetch(env, state, length, [&](CK_BYTE_PTR out, CK_ULONG_PTR len) {
-            return callModule(f->C_GetOperationState, static_cast<CK_SESSION_HANDLE>(jSession),
-                              out, len);
+            return callModule(f->C_GetOperationState, static_cast<CK_SESSION_HANDLE>(jSession), out,
+                              len);
         });
         return bytesOf(env, rv, state, length);
     });
 }
 
-VOK_PKCS11_METHOD(void, C_1SetOperationState)(JNIEnv* env, jobject thiz, jlong jSession,
-                                              jbyteArray jState, jlong jEncryptionKey,
-                                              jlong jAuthenticationKey) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1SetOperationState(
+    JNIEnv* env, jobject thiz, jlong jSession, jbyteArray jState, jlong jEncryptionKey,
+    jlong jAuthenticationKey) {
     nativeMethod<void>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         NativeBytes state;
         if (!state.from(env, jState)) return;
@@ -72,8 +79,10 @@ VOK_PKCS11_METHOD(void, C_1SetOperationState)(JNIEnv* env, jobject thiz, jlong j
     });
 }
 
-VOK_PKCS11_METHOD(void, C_1Login)(JNIEnv* env, jobject thiz, jlong jSession, jlong jUserType,
-                                  jcharArray jPin) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1Login(JNIEnv* env, jobject thiz,
+                                                                     jlong jSession,
+                                                                     jlong jUserType,
+                                                                     jcharArray jPin) {
     nativeMethod<void>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         NativeBytes pin;
         if (!pin.from(env, jPin)) return;
@@ -82,20 +91,24 @@ VOK_PKCS11_METHOD(void, C_1Login)(JNIEnv* env, jobject thiz, jlong jSession, jlo
     });
 }
 
-VOK_PKCS11_METHOD(void, C_1Logout)(JNIEnv* env, jobject thiz, jlong jSession) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1Logout(JNIEnv* env, jobject thiz,
+                                                                      jlong jSession) {
     nativeMethod<void>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         resultOf(env, callModule(f->C_Logout, static_cast<CK_SESSION_HANDLE>(jSession)));
     });
 }
 
-VOK_PKCS11_METHOD(void, C_1GetFunctionStatus)(JNIEnv* env, jobject thiz, jlong jSession) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1GetFunctionStatus(JNIEnv* env,
+                                                                                 jobject thiz,
+                                                                                 jlong jSession) {
     nativeMethod<void>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
-        resultOf(env,
-                 callModule(f->C_GetFunctionStatus, static_cast<CK_SESSION_HANDLE>(jSession)));
+        resultOf(env, callModule(f->C_GetFunctionStatus, static_cast<CK_SESSION_HANDLE>(jSession)));
     });
 }
 
-VOK_PKCS11_METHOD(void, C_1CancelFunction)(JNIEnv* env, jobject thiz, jlong jSession) {
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_C_1CancelFunction(JNIEnv* env,
+                                                                              jobject thiz,
+                                                                              jlong jSession) {
     nativeMethod<void>(env, thiz, __func__, [&](CK_FUNCTION_LIST_PTR f) {
         resultOf(env, callModule(f->C_CancelFunction, static_cast<CK_SESSION_HANDLE>(jSession)));
     });

@@ -149,8 +149,8 @@ JNIEXPORT void JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_setNextVendorRv
 
 // The fake vendor's record as text, one element per call.
 JNIEXPORT jobjectArray JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_vendorCalls(JNIEnv* env,
-                                                                                    jclass,
-                                                                                    jlong vendor) {
+                                                                                     jclass,
+                                                                                     jlong vendor) {
     using Count = CK_ULONG (*)();
     using Text = CK_RV (*)(CK_ULONG, char*, CK_ULONG_PTR);
     auto* handle = reinterpret_cast<void*>(vendor);
@@ -180,8 +180,8 @@ JNIEXPORT jobjectArray JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_vendorC
 // A fresh token in the fake vendor, with an empty record.
 JNIEXPORT void JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_resetVendor(JNIEnv* env, jclass,
                                                                              jlong vendor) {
-    auto reset = reinterpret_cast<void (*)()>(
-        dlsym(reinterpret_cast<void*>(vendor), "fake_vendor_reset"));
+    auto reset =
+        reinterpret_cast<void (*)()>(dlsym(reinterpret_cast<void*>(vendor), "fake_vendor_reset"));
     if (reset == nullptr) {
         throwIllegalState(env, "not the fake vendor module");
         return;
@@ -191,8 +191,10 @@ JNIEXPORT void JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_resetVendor(JNI
 
 // Calls a control of the fake vendor that takes one CK_ULONG
 // ("fake_vendor_set_signature_length").
-JNIEXPORT void JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_controlVendor(
-    JNIEnv* env, jclass, jlong vendor, jstring control, jlong value) {
+JNIEXPORT void JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_controlVendor(JNIEnv* env, jclass,
+                                                                               jlong vendor,
+                                                                               jstring control,
+                                                                               jlong value) {
     const char* chars = env->GetStringUTFChars(control, nullptr);
     if (chars == nullptr) return;
     void* symbol = dlsym(reinterpret_cast<void*>(vendor), chars);
