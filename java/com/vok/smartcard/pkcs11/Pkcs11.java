@@ -477,8 +477,8 @@ public class Pkcs11 {
 
     /**
      * Encrypts data in one part. The module is called once, with room for 260 bytes of output:
-     * longer ciphertexts fail with {@code CKR_BUFFER_TOO_SMALL}, which also ends the operation
-     * for modules that end it on any error. Encrypt longer data with {@link #C_EncryptUpdate}.
+     * a longer ciphertext fails with {@code CKR_BUFFER_TOO_SMALL}. Encrypt longer data in parts
+     * with {@link #C_EncryptUpdate}.
      *
      * @param hSession the session
      * @param pData the data
