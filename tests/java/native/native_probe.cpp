@@ -147,6 +147,65 @@ JNIEXPORT void JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_setNextVendorRv
     if (result != CKR_OK) throwIllegalState(env, "fake_vendor_set_next_rv refused");
 }
 
+// The fake vendor's record as text, one element per call.
+JNIEXPORT jobjectArray JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_vendorCalls(JNIEnv* env,
+                                                                                     jclass,
+                                                                                     jlong vendor) {
+    using Count = CK_ULONG (*)();
+    using Text = CK_RV (*)(CK_ULONG, char*, CK_ULONG_PTR);
+    auto* handle = reinterpret_cast<void*>(vendor);
+    auto count = reinterpret_cast<Count>(dlsym(handle, "fake_vendor_call_count"));
+    auto text = reinterpret_cast<Text>(dlsym(handle, "fake_vendor_call_text"));
+    jclass stringClass = env->FindClass("java/lang/String");
+    if (count == nullptr || text == nullptr || stringClass == nullptr) {
+        throwIllegalState(env, "not the fake vendor module");
+        return nullptr;
+    }
+    const CK_ULONG n = count();
+    jobjectArray result = env->NewObjectArray(static_cast<jsize>(n), stringClass, nullptr);
+    for (CK_ULONG i = 0; result != nullptr && i < n; ++i) {
+        CK_ULONG length = 0;
+        if (text(i, nullptr, &length) != CKR_OK) break;
+        std::string call(length, '\0');
+        text(i, &call[0], &length);
+        call.resize(length);
+        jstring element = env->NewStringUTF(call.c_str());
+        if (element == nullptr) return nullptr;
+        env->SetObjectArrayElement(result, static_cast<jsize>(i), element);
+        env->DeleteLocalRef(element);
+    }
+    return result;
+}
+
+// A fresh token in the fake vendor, with an empty record.
+JNIEXPORT void JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_resetVendor(JNIEnv* env, jclass,
+                                                                             jlong vendor) {
+    auto reset =
+        reinterpret_cast<void (*)()>(dlsym(reinterpret_cast<void*>(vendor), "fake_vendor_reset"));
+    if (reset == nullptr) {
+        throwIllegalState(env, "not the fake vendor module");
+        return;
+    }
+    reset();
+}
+
+// Calls a control of the fake vendor that takes one CK_ULONG
+// ("fake_vendor_set_signature_length").
+JNIEXPORT void JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_controlVendor(JNIEnv* env, jclass,
+                                                                               jlong vendor,
+                                                                               jstring control,
+                                                                               jlong value) {
+    const char* chars = env->GetStringUTFChars(control, nullptr);
+    if (chars == nullptr) return;
+    void* symbol = dlsym(reinterpret_cast<void*>(vendor), chars);
+    env->ReleaseStringUTFChars(control, chars);
+    if (symbol == nullptr) {
+        throwIllegalState(env, "no such control");
+        return;
+    }
+    reinterpret_cast<void (*)(CK_ULONG)>(symbol)(static_cast<CK_ULONG>(value));
+}
+
 JNIEXPORT void JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_closeVendor(JNIEnv*, jclass,
                                                                              jlong vendor) {
     dlclose(reinterpret_cast<void*>(vendor));

@@ -34,6 +34,15 @@ final class NativeProbe {
 
     static native void closeVendor(long vendor);
 
+    /** A fresh token in the fake vendor, with an empty call record. */
+    static native void resetVendor(long vendor);
+
+    /** The fake vendor's call record, one text per call (see fake_vendor.h). */
+    static native String[] vendorCalls(long vendor);
+
+    /** Calls a {@code fake_vendor_} control that takes one {@code CK_ULONG}. */
+    static native void controlVendor(long vendor, String control, long value);
+
     /** From now on the process's log lines are kept instead of printed. */
     static native void captureLog();
 

@@ -1,0 +1,46 @@
+#define LOG_TAG "[native jni pkcs11wrapper]"
+#include "entry_frame.h"
+
+#include <cstring>
+
+#include "java_objects.h"
+#include "registry.h"
+#include "vok_export.h"
+#include "vok_log.h"
+
+namespace vokjni {
+
+CK_FUNCTION_LIST_PTR connectedModule(JNIEnv* env, jobject thiz, const MethodRules& rules) {
+    ModuleEntry* entry = getModuleEntry(env, thiz);
+    if (env->ExceptionCheck()) return nullptr;
+    if (entry == nullptr) {
+        for (int i = 0; i < rules.missingEntryLines; ++i) VOK_LOGD("failed getting module entry");
+        throwDisconnectedRuntimeException(env);
+        return nullptr;
+    }
+    // An entry whose getter failed may have no list: no module to call.
+    if (entry->functionList == nullptr && !rules.listMayBeMissing)
+        throwDisconnectedRuntimeException(env);
+    return entry->functionList;
+}
+
+void failWithPendingOrOutOfMemory(JNIEnv* env) { throwOutOfMemoryUnlessPending(env); }
+
+bool allocateOutput(JNIEnv* env, CK_ULONG capacity, std::size_t elementSize, void** data) {
+    *data = nullptr;
+    if (!fitsJavaArray(env, capacity)) return false;
+    *data = allocArray(static_cast<std::size_t>(capacity), elementSize);
+    if (*data == nullptr) {
+        throwOutOfMemoryError(env);
+        return false;
+    }
+    return true;
+}
+
+std::string boundedText(const void* bytes, CK_ULONG length) {
+    if (bytes == nullptr) return std::string();
+    const auto* text = static_cast<const char*>(bytes);
+    return std::string(text, strnlen(text, static_cast<std::size_t>(length)));
+}
+
+}  // namespace vokjni
