@@ -53,12 +53,11 @@ struct Proxies {
 #undef VOK_FRONT_PROXY
 };
 
-// The loaded proxy library and the standard list that fronts it.
+// The loaded proxy library and the standard list that fronts it. The proxy
+// library stays loaded for the life of the process: it keeps its channel and
+// its function list (never freed) for whoever else in the process uses it.
 struct Front {
     Front();
-    ~Front() {
-        if (handle) dlclose(handle);
-    }
     Front(const Front&) = delete;
     Front& operator=(const Front&) = delete;
 
