@@ -1,9 +1,14 @@
 // The standard C_ names, for callers that call a module's functions by name
 // rather than through its function list: each calls the front's list entry of
-// its own name. This unit reads the standard header alone, so the compiler
-// checks every definition against the standard prototype of its name.
+// its own name with its own arguments. This unit reads the standard header
+// alone; every definition takes its parameter types from the standard pointer
+// type of its name (CK_C_xxx), and a wrong count conflicts with the standard
+// prototype, so the compiler holds each one to the standard.
 
 #include <p11-kit/pkcs11.h>
+
+#include <cstddef>
+#include <tuple>
 
 #include "front.h"
 #include "vok_export.h"
@@ -12,222 +17,107 @@ namespace {
 
 CK_FUNCTION_LIST_PTR entries() { return static_cast<CK_FUNCTION_LIST_PTR>(vok_front_list()); }
 
+// The type of parameter I of the function pointer type F.
+template <class F, size_t I>
+struct Parameter;
+template <class... A, size_t I>
+struct Parameter<CK_RV (*)(A...), I> {
+    using type = std::tuple_element_t<I, std::tuple<A...>>;
+};
+
 }  // namespace
 
-// name, parameters, arguments
-#define VOK_FRONT_FORWARD(name, params, args) \
-    VOK_EXPORT CK_RV name params { return entries()->name args; }
+// clang-format off
+#define VOK_FRONT_P(name, i) Parameter<CK_##name, i - 1>::type a##i
+#define VOK_FRONT_PARAMETERS_1(n) VOK_FRONT_P(n, 1)
+#define VOK_FRONT_PARAMETERS_2(n) VOK_FRONT_PARAMETERS_1(n), VOK_FRONT_P(n, 2)
+#define VOK_FRONT_PARAMETERS_3(n) VOK_FRONT_PARAMETERS_2(n), VOK_FRONT_P(n, 3)
+#define VOK_FRONT_PARAMETERS_4(n) VOK_FRONT_PARAMETERS_3(n), VOK_FRONT_P(n, 4)
+#define VOK_FRONT_PARAMETERS_5(n) VOK_FRONT_PARAMETERS_4(n), VOK_FRONT_P(n, 5)
+#define VOK_FRONT_PARAMETERS_6(n) VOK_FRONT_PARAMETERS_5(n), VOK_FRONT_P(n, 6)
+#define VOK_FRONT_PARAMETERS_7(n) VOK_FRONT_PARAMETERS_6(n), VOK_FRONT_P(n, 7)
+#define VOK_FRONT_PARAMETERS_8(n) VOK_FRONT_PARAMETERS_7(n), VOK_FRONT_P(n, 8)
+#define VOK_FRONT_ARGUMENTS_1 a1
+#define VOK_FRONT_ARGUMENTS_2 VOK_FRONT_ARGUMENTS_1, a2
+#define VOK_FRONT_ARGUMENTS_3 VOK_FRONT_ARGUMENTS_2, a3
+#define VOK_FRONT_ARGUMENTS_4 VOK_FRONT_ARGUMENTS_3, a4
+#define VOK_FRONT_ARGUMENTS_5 VOK_FRONT_ARGUMENTS_4, a5
+#define VOK_FRONT_ARGUMENTS_6 VOK_FRONT_ARGUMENTS_5, a6
+#define VOK_FRONT_ARGUMENTS_7 VOK_FRONT_ARGUMENTS_6, a7
+#define VOK_FRONT_ARGUMENTS_8 VOK_FRONT_ARGUMENTS_7, a8
 
-VOK_FRONT_FORWARD(C_Initialize, (CK_VOID_PTR pInitArgs), (pInitArgs))
-VOK_FRONT_FORWARD(C_Finalize, (CK_VOID_PTR pReserved), (pReserved))
-VOK_FRONT_FORWARD(C_GetInfo, (CK_INFO_PTR pInfo), (pInfo))
-VOK_FRONT_FORWARD(C_GetFunctionList, (CK_FUNCTION_LIST_PTR_PTR ppFunctionList), (ppFunctionList))
-VOK_FRONT_FORWARD(C_GetSlotList,
-                  (CK_BBOOL tokenPresent, CK_SLOT_ID_PTR pSlotList, CK_ULONG_PTR pulCount),
-                  (tokenPresent, pSlotList, pulCount))
-VOK_FRONT_FORWARD(C_GetSlotInfo, (CK_SLOT_ID slotID, CK_SLOT_INFO_PTR pInfo), (slotID, pInfo))
-VOK_FRONT_FORWARD(C_GetTokenInfo, (CK_SLOT_ID slotID, CK_TOKEN_INFO_PTR pInfo), (slotID, pInfo))
-VOK_FRONT_FORWARD(C_GetMechanismList,
-                  (CK_SLOT_ID slotID, CK_MECHANISM_TYPE_PTR pMechanismList, CK_ULONG_PTR pulCount),
-                  (slotID, pMechanismList, pulCount))
-VOK_FRONT_FORWARD(C_GetMechanismInfo,
-                  (CK_SLOT_ID slotID, CK_MECHANISM_TYPE type, CK_MECHANISM_INFO_PTR pInfo),
-                  (slotID, type, pInfo))
-VOK_FRONT_FORWARD(C_InitToken,
-                  (CK_SLOT_ID slotID, CK_UTF8CHAR_PTR pPin, CK_ULONG ulPinLen,
-                   CK_UTF8CHAR_PTR pLabel),
-                  (slotID, pPin, ulPinLen, pLabel))
-VOK_FRONT_FORWARD(C_InitPIN, (CK_SESSION_HANDLE hSession, CK_UTF8CHAR_PTR pPin, CK_ULONG ulPinLen),
-                  (hSession, pPin, ulPinLen))
-VOK_FRONT_FORWARD(C_SetPIN,
-                  (CK_SESSION_HANDLE hSession, CK_UTF8CHAR_PTR pOldPin, CK_ULONG ulOldLen,
-                   CK_UTF8CHAR_PTR pNewPin, CK_ULONG ulNewLen),
-                  (hSession, pOldPin, ulOldLen, pNewPin, ulNewLen))
-VOK_FRONT_FORWARD(C_OpenSession,
-                  (CK_SLOT_ID slotID, CK_FLAGS flags, CK_VOID_PTR pApplication, CK_NOTIFY Notify,
-                   CK_SESSION_HANDLE_PTR phSession),
-                  (slotID, flags, pApplication, Notify, phSession))
-VOK_FRONT_FORWARD(C_CloseSession, (CK_SESSION_HANDLE hSession), (hSession))
-VOK_FRONT_FORWARD(C_CloseAllSessions, (CK_SLOT_ID slotID), (slotID))
-VOK_FRONT_FORWARD(C_GetSessionInfo, (CK_SESSION_HANDLE hSession, CK_SESSION_INFO_PTR pInfo),
-                  (hSession, pInfo))
-VOK_FRONT_FORWARD(C_GetOperationState,
-                  (CK_SESSION_HANDLE hSession, CK_BYTE_PTR pOperationState,
-                   CK_ULONG_PTR pulOperationStateLen),
-                  (hSession, pOperationState, pulOperationStateLen))
-VOK_FRONT_FORWARD(C_SetOperationState,
-                  (CK_SESSION_HANDLE hSession, CK_BYTE_PTR pOperationState,
-                   CK_ULONG ulOperationStateLen, CK_OBJECT_HANDLE hEncryptionKey,
-                   CK_OBJECT_HANDLE hAuthenticationKey),
-                  (hSession, pOperationState, ulOperationStateLen, hEncryptionKey,
-                   hAuthenticationKey))
-VOK_FRONT_FORWARD(C_Login,
-                  (CK_SESSION_HANDLE hSession, CK_USER_TYPE userType, CK_UTF8CHAR_PTR pPin,
-                   CK_ULONG ulPinLen),
-                  (hSession, userType, pPin, ulPinLen))
-VOK_FRONT_FORWARD(C_Logout, (CK_SESSION_HANDLE hSession), (hSession))
-VOK_FRONT_FORWARD(C_CreateObject,
-                  (CK_SESSION_HANDLE hSession, CK_ATTRIBUTE_PTR pTemplate, CK_ULONG ulCount,
-                   CK_OBJECT_HANDLE_PTR phObject),
-                  (hSession, pTemplate, ulCount, phObject))
-VOK_FRONT_FORWARD(C_CopyObject,
-                  (CK_SESSION_HANDLE hSession, CK_OBJECT_HANDLE hObject, CK_ATTRIBUTE_PTR pTemplate,
-                   CK_ULONG ulCount, CK_OBJECT_HANDLE_PTR phNewObject),
-                  (hSession, hObject, pTemplate, ulCount, phNewObject))
-VOK_FRONT_FORWARD(C_DestroyObject, (CK_SESSION_HANDLE hSession, CK_OBJECT_HANDLE hObject),
-                  (hSession, hObject))
-VOK_FRONT_FORWARD(C_GetObjectSize,
-                  (CK_SESSION_HANDLE hSession, CK_OBJECT_HANDLE hObject, CK_ULONG_PTR pulSize),
-                  (hSession, hObject, pulSize))
-VOK_FRONT_FORWARD(C_GetAttributeValue,
-                  (CK_SESSION_HANDLE hSession, CK_OBJECT_HANDLE hObject, CK_ATTRIBUTE_PTR pTemplate,
-                   CK_ULONG ulCount),
-                  (hSession, hObject, pTemplate, ulCount))
-VOK_FRONT_FORWARD(C_SetAttributeValue,
-                  (CK_SESSION_HANDLE hSession, CK_OBJECT_HANDLE hObject, CK_ATTRIBUTE_PTR pTemplate,
-                   CK_ULONG ulCount),
-                  (hSession, hObject, pTemplate, ulCount))
-VOK_FRONT_FORWARD(C_FindObjectsInit,
-                  (CK_SESSION_HANDLE hSession, CK_ATTRIBUTE_PTR pTemplate, CK_ULONG ulCount),
-                  (hSession, pTemplate, ulCount))
-VOK_FRONT_FORWARD(C_FindObjects,
-                  (CK_SESSION_HANDLE hSession, CK_OBJECT_HANDLE_PTR phObject,
-                   CK_ULONG ulMaxObjectCount, CK_ULONG_PTR pulObjectCount),
-                  (hSession, phObject, ulMaxObjectCount, pulObjectCount))
-VOK_FRONT_FORWARD(C_FindObjectsFinal, (CK_SESSION_HANDLE hSession), (hSession))
-VOK_FRONT_FORWARD(C_EncryptInit,
-                  (CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism, CK_OBJECT_HANDLE hKey),
-                  (hSession, pMechanism, hKey))
-VOK_FRONT_FORWARD(C_Encrypt,
-                  (CK_SESSION_HANDLE hSession, CK_BYTE_PTR pData, CK_ULONG ulDataLen,
-                   CK_BYTE_PTR pEncryptedData, CK_ULONG_PTR pulEncryptedDataLen),
-                  (hSession, pData, ulDataLen, pEncryptedData, pulEncryptedDataLen))
-VOK_FRONT_FORWARD(C_EncryptUpdate,
-                  (CK_SESSION_HANDLE hSession, CK_BYTE_PTR pPart, CK_ULONG ulPartLen,
-                   CK_BYTE_PTR pEncryptedPart, CK_ULONG_PTR pulEncryptedPartLen),
-                  (hSession, pPart, ulPartLen, pEncryptedPart, pulEncryptedPartLen))
-VOK_FRONT_FORWARD(C_EncryptFinal,
-                  (CK_SESSION_HANDLE hSession, CK_BYTE_PTR pLastEncryptedPart,
-                   CK_ULONG_PTR pulLastEncryptedPartLen),
-                  (hSession, pLastEncryptedPart, pulLastEncryptedPartLen))
-VOK_FRONT_FORWARD(C_DecryptInit,
-                  (CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism, CK_OBJECT_HANDLE hKey),
-                  (hSession, pMechanism, hKey))
-VOK_FRONT_FORWARD(C_Decrypt,
-                  (CK_SESSION_HANDLE hSession, CK_BYTE_PTR pEncryptedData,
-                   CK_ULONG ulEncryptedDataLen, CK_BYTE_PTR pData, CK_ULONG_PTR pulDataLen),
-                  (hSession, pEncryptedData, ulEncryptedDataLen, pData, pulDataLen))
-VOK_FRONT_FORWARD(C_DecryptUpdate,
-                  (CK_SESSION_HANDLE hSession, CK_BYTE_PTR pEncryptedPart,
-                   CK_ULONG ulEncryptedPartLen, CK_BYTE_PTR pPart, CK_ULONG_PTR pulPartLen),
-                  (hSession, pEncryptedPart, ulEncryptedPartLen, pPart, pulPartLen))
-VOK_FRONT_FORWARD(C_DecryptFinal,
-                  (CK_SESSION_HANDLE hSession, CK_BYTE_PTR pLastPart, CK_ULONG_PTR pulLastPartLen),
-                  (hSession, pLastPart, pulLastPartLen))
-VOK_FRONT_FORWARD(C_DigestInit, (CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism),
-                  (hSession, pMechanism))
-VOK_FRONT_FORWARD(C_Digest,
-                  (CK_SESSION_HANDLE hSession, CK_BYTE_PTR pData, CK_ULONG ulDataLen,
-                   CK_BYTE_PTR pDigest, CK_ULONG_PTR pulDigestLen),
-                  (hSession, pData, ulDataLen, pDigest, pulDigestLen))
-VOK_FRONT_FORWARD(C_DigestUpdate,
-                  (CK_SESSION_HANDLE hSession, CK_BYTE_PTR pPart, CK_ULONG ulPartLen),
-                  (hSession, pPart, ulPartLen))
-VOK_FRONT_FORWARD(C_DigestKey, (CK_SESSION_HANDLE hSession, CK_OBJECT_HANDLE hKey),
-                  (hSession, hKey))
-VOK_FRONT_FORWARD(C_DigestFinal,
-                  (CK_SESSION_HANDLE hSession, CK_BYTE_PTR pDigest, CK_ULONG_PTR pulDigestLen),
-                  (hSession, pDigest, pulDigestLen))
-VOK_FRONT_FORWARD(C_SignInit,
-                  (CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism, CK_OBJECT_HANDLE hKey),
-                  (hSession, pMechanism, hKey))
-VOK_FRONT_FORWARD(C_Sign,
-                  (CK_SESSION_HANDLE hSession, CK_BYTE_PTR pData, CK_ULONG ulDataLen,
-                   CK_BYTE_PTR pSignature, CK_ULONG_PTR pulSignatureLen),
-                  (hSession, pData, ulDataLen, pSignature, pulSignatureLen))
-VOK_FRONT_FORWARD(C_SignUpdate, (CK_SESSION_HANDLE hSession, CK_BYTE_PTR pPart, CK_ULONG ulPartLen),
-                  (hSession, pPart, ulPartLen))
-VOK_FRONT_FORWARD(C_SignFinal,
-                  (CK_SESSION_HANDLE hSession, CK_BYTE_PTR pSignature,
-                   CK_ULONG_PTR pulSignatureLen),
-                  (hSession, pSignature, pulSignatureLen))
-VOK_FRONT_FORWARD(C_SignRecoverInit,
-                  (CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism, CK_OBJECT_HANDLE hKey),
-                  (hSession, pMechanism, hKey))
-VOK_FRONT_FORWARD(C_SignRecover,
-                  (CK_SESSION_HANDLE hSession, CK_BYTE_PTR pData, CK_ULONG ulDataLen,
-                   CK_BYTE_PTR pSignature, CK_ULONG_PTR pulSignatureLen),
-                  (hSession, pData, ulDataLen, pSignature, pulSignatureLen))
-VOK_FRONT_FORWARD(C_VerifyInit,
-                  (CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism, CK_OBJECT_HANDLE hKey),
-                  (hSession, pMechanism, hKey))
-VOK_FRONT_FORWARD(C_Verify,
-                  (CK_SESSION_HANDLE hSession, CK_BYTE_PTR pData, CK_ULONG ulDataLen,
-                   CK_BYTE_PTR pSignature, CK_ULONG ulSignatureLen),
-                  (hSession, pData, ulDataLen, pSignature, ulSignatureLen))
-VOK_FRONT_FORWARD(C_VerifyUpdate,
-                  (CK_SESSION_HANDLE hSession, CK_BYTE_PTR pPart, CK_ULONG ulPartLen),
-                  (hSession, pPart, ulPartLen))
-VOK_FRONT_FORWARD(C_VerifyFinal,
-                  (CK_SESSION_HANDLE hSession, CK_BYTE_PTR pSignature, CK_ULONG ulSignatureLen),
-                  (hSession, pSignature, ulSignatureLen))
-VOK_FRONT_FORWARD(C_VerifyRecoverInit,
-                  (CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism, CK_OBJECT_HANDLE hKey),
-                  (hSession, pMechanism, hKey))
-VOK_FRONT_FORWARD(C_VerifyRecover,
-                  (CK_SESSION_HANDLE hSession, CK_BYTE_PTR pSignature, CK_ULONG ulSignatureLen,
-                   CK_BYTE_PTR pData, CK_ULONG_PTR pulDataLen),
-                  (hSession, pSignature, ulSignatureLen, pData, pulDataLen))
-VOK_FRONT_FORWARD(C_DigestEncryptUpdate,
-                  (CK_SESSION_HANDLE hSession, CK_BYTE_PTR pPart, CK_ULONG ulPartLen,
-                   CK_BYTE_PTR pEncryptedPart, CK_ULONG_PTR pulEncryptedPartLen),
-                  (hSession, pPart, ulPartLen, pEncryptedPart, pulEncryptedPartLen))
-VOK_FRONT_FORWARD(C_DecryptDigestUpdate,
-                  (CK_SESSION_HANDLE hSession, CK_BYTE_PTR pEncryptedPart,
-                   CK_ULONG ulEncryptedPartLen, CK_BYTE_PTR pPart, CK_ULONG_PTR pulPartLen),
-                  (hSession, pEncryptedPart, ulEncryptedPartLen, pPart, pulPartLen))
-VOK_FRONT_FORWARD(C_SignEncryptUpdate,
-                  (CK_SESSION_HANDLE hSession, CK_BYTE_PTR pPart, CK_ULONG ulPartLen,
-                   CK_BYTE_PTR pEncryptedPart, CK_ULONG_PTR pulEncryptedPartLen),
-                  (hSession, pPart, ulPartLen, pEncryptedPart, pulEncryptedPartLen))
-VOK_FRONT_FORWARD(C_DecryptVerifyUpdate,
-                  (CK_SESSION_HANDLE hSession, CK_BYTE_PTR pEncryptedPart,
-                   CK_ULONG ulEncryptedPartLen, CK_BYTE_PTR pPart, CK_ULONG_PTR pulPartLen),
-                  (hSession, pEncryptedPart, ulEncryptedPartLen, pPart, pulPartLen))
-VOK_FRONT_FORWARD(C_GenerateKey,
-                  (CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism,
-                   CK_ATTRIBUTE_PTR pTemplate, CK_ULONG ulCount, CK_OBJECT_HANDLE_PTR phKey),
-                  (hSession, pMechanism, pTemplate, ulCount, phKey))
-VOK_FRONT_FORWARD(C_GenerateKeyPair,
-                  (CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism,
-                   CK_ATTRIBUTE_PTR pPublicKeyTemplate, CK_ULONG ulPublicKeyAttributeCount,
-                   CK_ATTRIBUTE_PTR pPrivateKeyTemplate, CK_ULONG ulPrivateKeyAttributeCount,
-                   CK_OBJECT_HANDLE_PTR phPublicKey, CK_OBJECT_HANDLE_PTR phPrivateKey),
-                  (hSession, pMechanism, pPublicKeyTemplate, ulPublicKeyAttributeCount,
-                   pPrivateKeyTemplate, ulPrivateKeyAttributeCount, phPublicKey, phPrivateKey))
-VOK_FRONT_FORWARD(C_WrapKey,
-                  (CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism,
-                   CK_OBJECT_HANDLE hWrappingKey, CK_OBJECT_HANDLE hKey, CK_BYTE_PTR pWrappedKey,
-                   CK_ULONG_PTR pulWrappedKeyLen),
-                  (hSession, pMechanism, hWrappingKey, hKey, pWrappedKey, pulWrappedKeyLen))
-VOK_FRONT_FORWARD(C_UnwrapKey,
-                  (CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism,
-                   CK_OBJECT_HANDLE hUnwrappingKey, CK_BYTE_PTR pWrappedKey,
-                   CK_ULONG ulWrappedKeyLen, CK_ATTRIBUTE_PTR pTemplate, CK_ULONG ulAttributeCount,
-                   CK_OBJECT_HANDLE_PTR phKey),
-                  (hSession, pMechanism, hUnwrappingKey, pWrappedKey, ulWrappedKeyLen, pTemplate,
-                   ulAttributeCount, phKey))
-VOK_FRONT_FORWARD(C_DeriveKey,
-                  (CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism,
-                   CK_OBJECT_HANDLE hBaseKey, CK_ATTRIBUTE_PTR pTemplate, CK_ULONG ulAttributeCount,
-                   CK_OBJECT_HANDLE_PTR phKey),
-                  (hSession, pMechanism, hBaseKey, pTemplate, ulAttributeCount, phKey))
-VOK_FRONT_FORWARD(C_SeedRandom, (CK_SESSION_HANDLE hSession, CK_BYTE_PTR pSeed, CK_ULONG ulSeedLen),
-                  (hSession, pSeed, ulSeedLen))
-VOK_FRONT_FORWARD(C_GenerateRandom,
-                  (CK_SESSION_HANDLE hSession, CK_BYTE_PTR RandomData, CK_ULONG ulRandomLen),
-                  (hSession, RandomData, ulRandomLen))
-VOK_FRONT_FORWARD(C_GetFunctionStatus, (CK_SESSION_HANDLE hSession), (hSession))
-VOK_FRONT_FORWARD(C_CancelFunction, (CK_SESSION_HANDLE hSession), (hSession))
-VOK_FRONT_FORWARD(C_WaitForSlotEvent, (CK_FLAGS flags, CK_SLOT_ID_PTR pSlot, CK_VOID_PTR pReserved),
-                  (flags, pSlot, pReserved))
+// name, number of parameters
+#define VOK_FRONT_FORWARD(name, count)                        \
+    VOK_EXPORT CK_RV name(VOK_FRONT_PARAMETERS_##count(name)) { \
+        return entries()->name(VOK_FRONT_ARGUMENTS_##count);    \
+    }
+
+VOK_FRONT_FORWARD(C_Initialize, 1)
+VOK_FRONT_FORWARD(C_Finalize, 1)
+VOK_FRONT_FORWARD(C_GetInfo, 1)
+VOK_FRONT_FORWARD(C_GetFunctionList, 1)
+VOK_FRONT_FORWARD(C_GetSlotList, 3)
+VOK_FRONT_FORWARD(C_GetSlotInfo, 2)
+VOK_FRONT_FORWARD(C_GetTokenInfo, 2)
+VOK_FRONT_FORWARD(C_GetMechanismList, 3)
+VOK_FRONT_FORWARD(C_GetMechanismInfo, 3)
+VOK_FRONT_FORWARD(C_InitToken, 4)
+VOK_FRONT_FORWARD(C_InitPIN, 3)
+VOK_FRONT_FORWARD(C_SetPIN, 5)
+VOK_FRONT_FORWARD(C_OpenSession, 5)
+VOK_FRONT_FORWARD(C_CloseSession, 1)
+VOK_FRONT_FORWARD(C_CloseAllSessions, 1)
+VOK_FRONT_FORWARD(C_GetSessionInfo, 2)
+VOK_FRONT_FORWARD(C_GetOperationState, 3)
+VOK_FRONT_FORWARD(C_SetOperationState, 5)
+VOK_FRONT_FORWARD(C_Login, 4)
+VOK_FRONT_FORWARD(C_Logout, 1)
+VOK_FRONT_FORWARD(C_CreateObject, 4)
+VOK_FRONT_FORWARD(C_CopyObject, 5)
+VOK_FRONT_FORWARD(C_DestroyObject, 2)
+VOK_FRONT_FORWARD(C_GetObjectSize, 3)
+VOK_FRONT_FORWARD(C_GetAttributeValue, 4)
+VOK_FRONT_FORWARD(C_SetAttributeValue, 4)
+VOK_FRONT_FORWARD(C_FindObjectsInit, 3)
+VOK_FRONT_FORWARD(C_FindObjects, 4)
+VOK_FRONT_FORWARD(C_FindObjectsFinal, 1)
+VOK_FRONT_FORWARD(C_EncryptInit, 3)
+VOK_FRONT_FORWARD(C_Encrypt, 5)
+VOK_FRONT_FORWARD(C_EncryptUpdate, 5)
+VOK_FRONT_FORWARD(C_EncryptFinal, 3)
+VOK_FRONT_FORWARD(C_DecryptInit, 3)
+VOK_FRONT_FORWARD(C_Decrypt, 5)
+VOK_FRONT_FORWARD(C_DecryptUpdate, 5)
+VOK_FRONT_FORWARD(C_DecryptFinal, 3)
+VOK_FRONT_FORWARD(C_DigestInit, 2)
+VOK_FRONT_FORWARD(C_Digest, 5)
+VOK_FRONT_FORWARD(C_DigestUpdate, 3)
+VOK_FRONT_FORWARD(C_DigestKey, 2)
+VOK_FRONT_FORWARD(C_DigestFinal, 3)
+VOK_FRONT_FORWARD(C_SignInit, 3)
+VOK_FRONT_FORWARD(C_Sign, 5)
+VOK_FRONT_FORWARD(C_SignUpdate, 3)
+VOK_FRONT_FORWARD(C_SignFinal, 3)
+VOK_FRONT_FORWARD(C_SignRecoverInit, 3)
+VOK_FRONT_FORWARD(C_SignRecover, 5)
+VOK_FRONT_FORWARD(C_VerifyInit, 3)
+VOK_FRONT_FORWARD(C_Verify, 5)
+VOK_FRONT_FORWARD(C_VerifyUpdate, 3)
+VOK_FRONT_FORWARD(C_VerifyFinal, 3)
+VOK_FRONT_FORWARD(C_VerifyRecoverInit, 3)
+VOK_FRONT_FORWARD(C_VerifyRecover, 5)
+VOK_FRONT_FORWARD(C_DigestEncryptUpdate, 5)
+VOK_FRONT_FORWARD(C_DecryptDigestUpdate, 5)
+VOK_FRONT_FORWARD(C_SignEncryptUpdate, 5)
+VOK_FRONT_FORWARD(C_DecryptVerifyUpdate, 5)
+VOK_FRONT_FORWARD(C_GenerateKey, 5)
+VOK_FRONT_FORWARD(C_GenerateKeyPair, 8)
+VOK_FRONT_FORWARD(C_WrapKey, 6)
+VOK_FRONT_FORWARD(C_UnwrapKey, 8)
+VOK_FRONT_FORWARD(C_DeriveKey, 6)
+VOK_FRONT_FORWARD(C_SeedRandom, 3)
+VOK_FRONT_FORWARD(C_GenerateRandom, 3)
+VOK_FRONT_FORWARD(C_GetFunctionStatus, 1)
+VOK_FRONT_FORWARD(C_CancelFunction, 1)
+VOK_FRONT_FORWARD(C_WaitForSlotEvent, 3)
+// clang-format on
