@@ -1,10 +1,7 @@
 #!/usr/bin/env bash
-# OpenSC's pkcs11-tool through the standard front, the proxy, the socket, the
-# Java service host, the module bridge and SoftHSM2, compared with pkcs11-tool
-# straight on SoftHSM2 for the same tokens. Run by scripts/demo as its client
-# (token "vok-demo" with the user PIN given, SOFTHSM2_CONF exported):
-#
-#   pkcs11_tool_test.sh <proxy library> <server id> <user PIN> <file>
+# pkcs11-tool through the front, the proxy, the service, the bridge and
+# SoftHSM2, against pkcs11-tool straight on SoftHSM2 for the same tokens. Run as
+# scripts/demo's client: <proxy library> <server id> <user PIN> <file>.
 set -uo pipefail
 export VOK_SERVER_ID=$2
 front=$(dirname "$1")/libvokfront.so
@@ -53,11 +50,10 @@ so=(--token-label fresh --login --login-type so --so-pin 11223344 --init-pin --n
 says "--init-pin fails" 1 "C_InitPIN failed: rv = CKR_DEVICE_ERROR" through "${so[@]}"
 says "user PIN set straight" 0 "User PIN successfully initialized" straight "${so[@]}"
 
-# pkcs11-tool's own checks with one key pair on the token (which checks it makes
-# depends on the order of the keys, and SoftHSM2's differs between processes).
-# Through the system its first RSA verification, in one part, fails (the
-# single-part C_Verify never hands the module the signature), and it skips the
-# key's other verification mechanisms.
+# pkcs11-tool's own checks, with one key pair on the token (SoftHSM2 orders keys
+# differently in each process). Through the system its first RSA verification,
+# in one part, fails (C_Verify never hands the module the signature), and it
+# skips the key's other verification mechanisms.
 says "--keypairgen EC P-256" 0 "EC_POINT 256 bits" through "${demo[@]}" --keypairgen \
   --key-type EC:prime256v1 --label ec1 --id 01
 same "--test with an EC key pair" cat "${demo[@]}" --test
