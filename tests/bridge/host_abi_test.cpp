@@ -1,5 +1,6 @@
 // The conversions of the structures whose layouts differ on this host, in both
-// directions: every member lands where the other header puts it.
+// directions: every member lands where the other header puts it, and a member
+// a callee leaves alone keeps the caller's value.
 
 #include "host_abi.h"
 
@@ -37,6 +38,15 @@ void expectEveryMemberPlaced(const char* name, const std::vector<Member>& member
         << name << " to the packed layout";
     EXPECT_THAT(differingMembers(members, packed.data(), toStandard.data()), ::testing::IsEmpty())
         << name << " to the standard layout";
+    // Through a callee that writes nothing, the caller's structure comes back
+    // as it was: the callee's starts as the caller's.
+    Bytes packedCaller = packed, standardCaller = standard;
+    CK_RV (*writesStandard)(H*) = [](H*) -> CK_RV { return CKR_OK; };
+    CK_RV (*writesPacked)(P*) = [](P*) -> CK_RV { return CKR_OK; };
+    vok::hostabi::cross(writesStandard, reinterpret_cast<P*>(packedCaller.data()));
+    vok::hostabi::cross(writesPacked, reinterpret_cast<H*>(standardCaller.data()));
+    EXPECT_EQ(packedCaller, packed) << name << " from the packed layout and back";
+    EXPECT_EQ(standardCaller, standard) << name << " from the standard layout and back";
     size_t covered = 0;
     for (const Member& m : members) covered += m.packedSize;
     EXPECT_EQ(covered, sizeof(P)) << name << ": the table misses members";

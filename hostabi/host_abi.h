@@ -280,15 +280,21 @@ bool refused(const T&) {
 }
 
 // A structure pointer: the caller's own structure where both layouts agree;
-// otherwise a zeroed structure of the callee's layout, converted back into the
-// caller's after a successful call. The converted structures are all outputs.
+// otherwise a structure of the callee's layout that starts as the caller's and
+// is converted back into it after a successful call (the converted structures
+// are all outputs). A member the callee leaves alone, such as a text that the
+// proxies do not copy, so keeps the caller's value, as it would without the
+// conversion.
 template <class To, class From>
 class Arg<To*, From*, std::enable_if_t<!std::is_same_v<To, From>>> {
     static_assert(std::is_same_v<typename Twin<From>::type, To>, "structures that do not pair");
     static constexpr bool kSame = Twin<From>::kSameLayout;
 
 public:
-    explicit Arg(From* caller) : caller_(caller) {}
+    explicit Arg(From* caller) : caller_(caller) {
+        if constexpr (!kSame)
+            if (caller_) convert(*caller_, &callee_);
+    }
     To* get() {
         if constexpr (kSame)
             return reinterpret_cast<To*>(caller_);
