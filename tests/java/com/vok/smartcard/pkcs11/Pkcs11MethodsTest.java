@@ -461,8 +461,8 @@ class Pkcs11MethodsTest {
         assertEquals(2, back.length);
         assertEquals(CKA_ENCRYPT, back[0].type);
         assertEquals(CKA_VALUE_LEN, back[1].type);
-        assertNull(back[0].pValue);
-        assertNull(back[1].pValue);
+        assertEquals(Boolean.TRUE, back[0].pValue);
+        assertEquals(16L, back[1].pValue);
     }
 
     @Test
