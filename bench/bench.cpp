@@ -10,6 +10,7 @@
 //             --softhsm <module> --p11kit-client <module> --pin <user PIN>
 //             --service-pid <pid> --json <file>
 //             [--rounds N] [--budget-ms M] [--small-calls N] [--big-mib N]
+//             [--ops <key>,<key>...]    only these operations (see ways.cpp)
 //
 // Prints the table on standard output and writes the figures as JSON. Exit
 // status 0 when every way could be set up and the run finished, whatever the
@@ -45,6 +46,10 @@ struct Options {
         auto it = values.find(name);
         if (it == values.end()) throw std::runtime_error("missing --" + name);
         return it->second;
+    }
+    std::string text(const std::string& name, const std::string& fallback) const {
+        auto it = values.find(name);
+        return it == values.end() ? fallback : it->second;
     }
     long number(const std::string& name, long fallback) const {
         auto it = values.find(name);
@@ -196,7 +201,12 @@ int run(PingPong& pingPong, const Options& o) {
         }
     }
 
-    const auto& ops = operations();
+    // --ops getinfo,digest1m runs only those (for profiling one operation).
+    const std::string only = "," + o.text("ops", "") + ",";
+    std::vector<Operation> ops;
+    for (const Operation& op : operations())
+        if (only == ",," || only.find("," + std::string(op.key) + ",") != std::string::npos)
+            ops.push_back(op);
     for (const Operation& op : ops) results.operations.push_back({&op, std::vector<Cell>(3)});
     for (size_t bytes : {size_t{32}, size_t{4096}, PingPong::kLargest})
         results.floors.push_back({bytes, Cell()});
