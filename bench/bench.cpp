@@ -236,8 +236,7 @@ int run(PingPong& pingPong, const Options& o) {
             const size_t i = (k + static_cast<size_t>(round)) % ops.size();
             for (size_t j = 0; j < ways.size(); ++j) {
                 const size_t w = (j + static_cast<size_t>(round)) % ways.size();
-                runCell(ops[i], ways[w], scratch, budget, maxCalls,
-                        results.operations[i].ways[w]);
+                runCell(ops[i], ways[w], scratch, budget, maxCalls, results.operations[i].ways[w]);
             }
             if (k < results.floors.size())
                 runFloor(pingPong, budget, maxCalls,

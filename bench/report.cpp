@@ -161,8 +161,7 @@ void printTable(const Results& r, std::FILE* out) {
     const size_t kName = 30, kCell = 27, kRatio = 9;
     std::string line = padded("operation", kName);
     for (const std::string& way : r.wayNames) line += padded(way, kCell);
-    line += padded("floor", kCell) + padded("÷p11-kit", kRatio) + padded("÷floor", kRatio) +
-            "goal";
+    line += padded("floor", kCell) + padded("÷p11-kit", kRatio) + padded("÷floor", kRatio) + "goal";
     std::fprintf(out, "%s\n", line.c_str());
     for (const OperationResults& o : r.operations) {
         line = padded(o.op->name, kName);
@@ -244,8 +243,8 @@ bool writeJson(const Results& r, const std::string& path) {
     out << "], \"big_digest_bytes\": " << m.bigDigestBytes
         << ", \"rss_kib_before_big\": " << m.rssBeforeBigKiB
         << ", \"rss_kib_peak_during_big\": " << m.rssPeakDuringBigKiB
-        << ", \"rss_kib_after_big\": " << m.rssAfterBigKiB
-        << ", \"failure\": " << quoted(m.failure) << "}\n}\n";
+        << ", \"rss_kib_after_big\": " << m.rssAfterBigKiB << ", \"failure\": " << quoted(m.failure)
+        << "}\n}\n";
     std::ofstream file(path);
     file << out.str();
     return static_cast<bool>(file);

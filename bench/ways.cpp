@@ -65,9 +65,7 @@ CK_RV getSlotList(Way& w, Scratch&) {
     return w.f->C_GetSlotList(CK_TRUE, slots, &count);
 }
 
-CK_RV random32(Way& w, Scratch& s) {
-    return w.f->C_GenerateRandom(w.handle(), s.out.data(), 32);
-}
+CK_RV random32(Way& w, Scratch& s) { return w.f->C_GenerateRandom(w.handle(), s.out.data(), 32); }
 
 CK_RV none(Way&, Scratch&) { return CKR_OK; }
 

@@ -56,11 +56,11 @@ struct Scratch {
 // zeroing the output) then `call` (timed). Each returns a CK_RV.
 struct Operation {
     const char* name;
-    const char* key;     // short name for the JSON and the chart
-    size_t bytes;        // payload that crosses, for MB/s; 0 for none
-    size_t floorBytes;   // the ping-pong it compares with
-    double p11kitGoal;   // the proxy's time at most this times p11-kit's; 0: none
-    double floorGoal;    // the proxy's time at most this times the floor's; 0: none
+    const char* key;    // short name for the JSON and the chart
+    size_t bytes;       // payload that crosses, for MB/s; 0 for none
+    size_t floorBytes;  // the ping-pong it compares with
+    double p11kitGoal;  // the proxy's time at most this times p11-kit's; 0: none
+    double floorGoal;   // the proxy's time at most this times the floor's; 0: none
     CK_RV (*prepare)(Way&, Scratch&);
     CK_RV (*call)(Way&, Scratch&);
 };
