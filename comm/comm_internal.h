@@ -88,18 +88,6 @@ int32_t noThrow(int32_t onException, Body&& body) {
 // vokpkcs11_comm_server_init has returned 0.
 pthread_t serverThread();
 
-// The string form of a CommandCallback, for the server executor of this
-// library: it gives the same answers and statuses, but takes the request as
-// the string the channel received it into and leaves the answer in `answer`,
-// which the channel sends as it is, so that a large payload is not copied on
-// the way. Called on the server thread only.
-using StringCommandCallback = int32_t (*)(const std::string& request, std::string* answer);
-
-// Makes the server thread call `serve` for every PKCS#11 command while
-// `callback` is the registered CommandCallback. Call before
-// vokpkcs11_comm_server_init.
-void registerStringForm(CommandCallback callback, StringCommandCallback serve);
-
 }  // namespace vokcomm
 
 #endif

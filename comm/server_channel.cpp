@@ -32,9 +32,6 @@ pthread_t serverThreadHandle;
 int listenFd = -1;
 // Stored by init after the thread has started, read by the thread.
 std::atomic<CommandCallback> commandCallback{nullptr};
-// The string form of one callback (registerStringForm), set before init.
-CommandCallback stringFormOf = nullptr;
-vokcomm::StringCommandCallback stringForm = nullptr;
 // Written by the server thread, read by anyone without a lock.
 std::atomic<int32_t> lastRequestTime{0};
 std::atomic<int32_t> lastResponseTime{0};
@@ -121,20 +118,8 @@ bool closesConnection(int32_t status) {
 int32_t callCallback(CommandCallback callback, const void* request, int32_t length, void** response,
                      uint32_t* responseLength) {
     // An exception out of the dispatcher is most likely a failed allocation.
-    return vokcomm::noThrow(CHANNEL_OUT_OF_MEMORY, [&] {
-        if (callback != stringFormOf || stringForm == nullptr)
-            return callback(request, length, response, responseLength);
-        const std::string bytes(static_cast<const char*>(request), static_cast<size_t>(length));
-        std::string answer;
-        const int32_t status = stringForm(bytes, &answer);
-        if (status != CHANNEL_OK) return status;
-        // A failed allocation leaves the empty answer, as the callback would.
-        auto* buffer = new (std::nothrow) uint8_t[answer.size()];
-        if (buffer != nullptr) std::memcpy(buffer, answer.data(), answer.size());
-        *response = buffer;
-        *responseLength = buffer != nullptr ? static_cast<uint32_t>(answer.size()) : 0;
-        return status;
-    });
+    return vokcomm::noThrow(CHANNEL_OUT_OF_MEMORY,
+                            [&] { return callback(request, length, response, responseLength); });
 }
 
 int32_t processPkcs11Command(const void* payload, int32_t length, void** response,
@@ -411,8 +396,3 @@ VOK_C_API int32_t vokpkcs11_comm_server_getLastUsageTime(void) {
 }
 
 pthread_t vokcomm::serverThread() { return serverThreadHandle; }
-
-void vokcomm::registerStringForm(CommandCallback callback, StringCommandCallback serve) {
-    stringFormOf = callback;
-    stringForm = serve;
-}

@@ -115,28 +115,14 @@ std::string dispatch(const std::string& request) {
     return std::string();
 }
 
-// The answer to one request; empty for a command nobody serves, and when
-// building it failed (most likely out of memory before a handler ran).
-std::string answerTo(const std::string& request) noexcept {
-    std::string result;
-    try {
-        result = dispatch(request);
-    } catch (...) {
-        result.clear();
-    }
-    if (result.size() > vok::server::kFrameLimit) result.clear();
-    return result;
-}
-
-// Generate_Operation_Result_Server in the form the server thread calls. The
-// thread attaches itself to the Java VM here, once, and stays attached (unlike
-// any other native thread, which the registry attaches for each lookup): see
-// keepThreadAttachedToJavaVm.
-int32_t serveOnServerThread(const std::string& request, std::string* answer) {
+// The server thread looks its module up for every command. It attaches itself
+// to the Java VM on its first command and stays attached, where the registry
+// would attach and detach it around each lookup (as it still does for any other
+// native thread): see keepThreadAttachedToJavaVm.
+void keepServerThreadAttached() {
     static thread_local bool attached = false;
-    if (!attached) attached = keepThreadAttachedToJavaVm() == 1;
-    *answer = answerTo(request);
-    return 0;
+    if (!attached && pthread_equal(pthread_self(), vokcomm::serverThread()))
+        attached = keepThreadAttachedToJavaVm() == 1;
 }
 
 }  // namespace
@@ -144,7 +130,6 @@ int32_t serveOnServerThread(const std::string& request, std::string* answer) {
 int32_t vokpkcs11_init_server(const char* serverId) {
     VOK_LOGD("server init");
     setModuleName_Server(serverId);
-    vokcomm::registerStringForm(Generate_Operation_Result_Server, serveOnServerThread);
     return vokpkcs11_comm_server_init(serverId, Generate_Operation_Result_Server);
 }
 
@@ -170,16 +155,18 @@ int32_t setModuleName_Server(const char* name) {
 int32_t Generate_Operation_Result_Server(const void* request, int32_t requestLength,
                                          void** response, uint32_t* responseLength) {
     if (response == nullptr || responseLength == nullptr) return 0;
+    keepServerThreadAttached();
     std::string result;
     try {
         std::string bytes;
         if (request != nullptr && requestLength > 0)
             bytes.assign(static_cast<const char*>(request), static_cast<size_t>(requestLength));
-        result = answerTo(bytes);
+        result = dispatch(bytes);
     } catch (...) {
         // Out of memory before a handler ran: answered like an unknown command.
         result.clear();
     }
+    if (result.size() > vok::server::kFrameLimit) result.clear();
     // A failed allocation also leaves the empty answer.
     uint8_t* buffer = new (std::nothrow) uint8_t[result.size()];
     if (buffer) std::memcpy(buffer, result.data(), result.size());
