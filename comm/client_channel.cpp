@@ -28,6 +28,11 @@ std::atomic<uint8_t> initialized{0};
 // (or the lock itself) from under an exchange in flight.
 pthread_mutex_t clientLock = PTHREAD_MUTEX_INITIALIZER;
 uint8_t drainBuffer[256];
+// Under clientLock. What the service sent beyond the frame being read stays
+// here until the next exchange's drain discards it, as it would have
+// discarded it from the socket.
+constexpr size_t kReceiveStageBytes = 16 * 1024;
+vokcomm::ReceiveStage receiveStage(kReceiveStageBytes);
 
 // Under clientLock. After a timeout or any failure that leaves the stream's
 // framing in doubt, a late answer may still come on this connection, after
@@ -59,7 +64,11 @@ int32_t exitWith(int32_t status) {
 void closeSocket() {
     close(socketFd);
     socketFd = -1;
+    receiveStage.discard();
 }
+
+void reportWritten(ssize_t n) { VOK_LOGD("Bytes written:%d", static_cast<int>(n)); }
+void reportRead(ssize_t n) { VOK_LOGD("Bytes read:%d", static_cast<int>(n)); }
 
 // Checked in this order; the first mismatch decides the status.
 int32_t checkVersionHeader(const FrameHeader& header) {
@@ -149,10 +158,24 @@ int32_t framingLost(int32_t status) {
 // so the next header read lines up with a fresh response. An abandoned
 // exchange's late answer never comes here: its connection has been given up.
 void drainStaleBytes() {
+    if (receiveStage.staged() > 0) {
+        VOK_LOGD("Recv returned :%d", static_cast<int>(receiveStage.staged()));
+        receiveStage.discard();
+    }
     ssize_t n;
     while ((n = recv(socketFd, drainBuffer, sizeof(drainBuffer), MSG_DONTWAIT)) > 0)
         VOK_LOGD("Recv returned :%d", static_cast<int>(n));
     VOK_LOGD("Errno:%s", std::strerror(errno));
+}
+
+// client_recv_data's statuses and lines, through the stage: the answer's
+// header and a small payload come in with one recv.
+int32_t receiveStaged(void* buf, int32_t len) {
+    if (invalidTransferArguments(socketFd, buf, len, "client_recv_data"))
+        return CHANNEL_INVALID_ARGUMENTS;
+    const ssize_t n = receiveStage.read(socketFd, buf, static_cast<size_t>(len), reportRead);
+    if (n < 1) return exitWith(n < 0 ? CHANNEL_RECV_FAILED : CHANNEL_PEER_CLOSED);
+    return exitWith(CHANNEL_OK);
 }
 
 int32_t receivePayload(int32_t dataLen, void** response, uint32_t* responseLength) {
@@ -164,7 +187,7 @@ int32_t receivePayload(int32_t dataLen, void** response, uint32_t* responseLengt
         VOK_LOGD("Malloc failed");
         return framingLost(CHANNEL_OUT_OF_MEMORY);
     }
-    int32_t status = client_recv_data(socketFd, payload.get(), dataLen);
+    int32_t status = receiveStaged(payload.get(), dataLen);
     if (status != CHANNEL_OK) {
         VOK_LOGD("Client receive data failed %d", status);
         return framingLost(status);
@@ -173,6 +196,21 @@ int32_t receivePayload(int32_t dataLen, void** response, uint32_t* responseLengt
     *responseLength = static_cast<uint32_t>(dataLen);
     VOK_LOGD("Exit - Success");
     return CHANNEL_OK;
+}
+
+// Header and request in one sendmsg, with client_send_data's statuses; a
+// failure is logged as the header's when the header did not get out whole.
+int32_t sendRequest(const FrameHeader& header, const void* request) {
+    const vokcomm::FrameSend sent =
+        vokcomm::sendFrame(socketFd, header, request, static_cast<size_t>(header.data_len),
+                           MSG_NOSIGNAL, reportWritten);
+    if (sent.failed == 1) return exitWith(CHANNEL_OK);
+    const int32_t status = exitWith(sent.failed < 0 ? CHANNEL_SEND_FAILED : CHANNEL_PEER_CLOSED);
+    if (sent.sent < sizeof(header))
+        VOK_LOGD("Client send header failed %d", status);
+    else
+        VOK_LOGD("Client send data failed %d", status);
+    return status;
 }
 
 int32_t exchangeLocked(const void* request, int32_t length, void** response,
@@ -190,19 +228,11 @@ int32_t exchangeLocked(const void* request, int32_t length, void** response,
     // From the first byte sent on, a failure leaves the stream in doubt: the
     // service may hold half a request, or answer it later.
     FrameHeader header = {FRAME_ID_PKCS11, FRAME_TYPE_REQUEST, 0, length};
-    int32_t status = client_send_data(socketFd, &header, sizeof(header));
-    if (status != CHANNEL_OK) {
-        VOK_LOGD("Client send header failed %d", status);
-        return framingLost(status);
-    }
-    status = client_send_data(socketFd, request, length);
-    if (status != CHANNEL_OK) {
-        VOK_LOGD("Client send data failed %d", status);
-        return framingLost(status);
-    }
+    int32_t status = sendRequest(header, request);
+    if (status != CHANNEL_OK) return framingLost(status);
 
     header = FrameHeader{};
-    status = client_recv_data(socketFd, &header, sizeof(header));
+    status = receiveStaged(&header, sizeof(header));
     if (status != CHANNEL_OK) {
         VOK_LOGD("Client receive header failed %d", status);
         return framingLost(status);

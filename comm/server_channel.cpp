@@ -22,6 +22,8 @@
 namespace {
 
 constexpr int kListenBacklog = 1;
+// A request's header and a payload of up to this size arrive with one recv.
+constexpr size_t kReceiveStageBytes = 64 * 1024;
 constexpr useconds_t kAcceptBackoffMicros = 100 * 1000;
 
 uint8_t serverInitialized = 0;
@@ -87,6 +89,25 @@ void consumePendingSigpipe() {
 int32_t exitWith(int32_t status) {
     VOK_LOGD("Exit ret:%d", status);
     return status;
+}
+
+void reportRead(ssize_t n) { VOK_LOGD("Bytes read:%d", static_cast<int>(n)); }
+
+void reportWritten(ssize_t n) {
+    if (n < 0 && errno == EPIPE) consumePendingSigpipe();
+    VOK_LOGD("Bytes written:%d", static_cast<int>(n));
+}
+
+// server_recv_data, through a connection's stage.
+int32_t receive(int fd, vokcomm::ReceiveStage& stage, void* buf, int32_t len) {
+    VOK_LOGD("Entry - Recv buf len:%d", len);
+    if (fd < 0 || buf == nullptr || len < 1) {
+        std::printf("[%s]:%s() - Invalid argument\n", LOG_TAG, "server_recv_data");
+        return CHANNEL_INVALID_ARGUMENTS;
+    }
+    const ssize_t n = stage.read(fd, buf, static_cast<size_t>(len), reportRead);
+    if (n < 1) return exitWith(n < 0 ? CHANNEL_SERVER_IO_FAILED : CHANNEL_SERVER_PEER_CLOSED);
+    return exitWith(CHANNEL_OK);
 }
 
 bool closesConnection(int32_t status) {
@@ -156,31 +177,50 @@ int32_t processCommand(int32_t id, const void* payload, int32_t length, void** r
     }
 }
 
+// Header and answer in one sendmsg, with server_send_data's statuses.
+int32_t sendHeaderAndAnswer(int fd, const FrameHeader& header, const void* payload,
+                            bool* headerSent) {
+    VOK_LOGD("Entry - send data len:%d", static_cast<int>(sizeof(header)) + header.data_len);
+    const vokcomm::FrameSend sent = vokcomm::sendFrame(
+        fd, header, payload, static_cast<size_t>(header.data_len), 0, reportWritten);
+    *headerSent = sent.sent >= sizeof(header);
+    if (sent.failed == 1) return exitWith(CHANNEL_OK);
+    return exitWith(sent.failed < 0 ? CHANNEL_SEND_FAILED : CHANNEL_SERVER_IO_FAILED);
+}
+
 int32_t sendResponse(int fd, FrameHeader header, void* response, uint32_t responseLength) {
     // Allocated with new[] by the callback (and by the version command).
     std::unique_ptr<uint8_t[]> owned(static_cast<uint8_t*>(response));
     header.data_len = static_cast<int32_t>(responseLength);
     header.type = FRAME_TYPE_RESPONSE;
     header.status = CHANNEL_OK;
-    int32_t status = server_send_data(fd, &header, sizeof(header));
-    if (status != CHANNEL_OK) {
+    int32_t status;
+    bool headerSent = false;
+    if (owned && header.data_len > 0) {
+        status = sendHeaderAndAnswer(fd, header, owned.get(), &headerSent);
+    } else {
+        // The header goes alone; the send helper then refuses the empty answer.
+        status = server_send_data(fd, &header, sizeof(header));
+        headerSent = status == CHANNEL_OK;
+        if (headerSent) status = server_send_data(fd, owned.get(), header.data_len);
+    }
+    if (!headerSent) {
         VOK_LOGD("Send header failed %d", status);
         return status;
     }
-    status = server_send_data(fd, owned.get(), header.data_len);
     recordResponseTime();
     owned.reset();
     return exitWith(status);
 }
 
-int32_t processClientCommand(int fd) {
+int32_t processClientCommand(int fd, vokcomm::ReceiveStage& stage) {
     VOK_LOGD("\n\n================");
     VOK_LOGD("Entry");
     void* response = nullptr;
     uint32_t responseLength = 0;
     FrameHeader header = {};
 
-    int32_t status = server_recv_data(fd, &header, sizeof(header));
+    int32_t status = receive(fd, stage, &header, sizeof(header));
     VOK_LOGD("Header data length field value :%d", header.data_len);
     VOK_LOGD("Received command:%d", header.id);
     if (status != CHANNEL_OK) {
@@ -203,7 +243,7 @@ int32_t processClientCommand(int fd) {
         VOK_LOGD("Malloc failed");
         return CHANNEL_OUT_OF_MEMORY;
     }
-    status = server_recv_data(fd, payload.get(), header.data_len);
+    status = receive(fd, stage, payload.get(), header.data_len);
     if (status != CHANNEL_OK) {
         VOK_LOGD("Receive command data failed");
         return status;
@@ -218,9 +258,10 @@ int32_t processClientCommand(int fd) {
 }
 
 void serveClient(int fd) {
+    vokcomm::ReceiveStage stage(kReceiveStageBytes);
     int32_t status;
     do {
-        status = processClientCommand(fd);
+        status = processClientCommand(fd, stage);
         VOK_LOGD("process_client_command ret :%d", status);
     } while (!closesConnection(status));
 }
@@ -309,21 +350,8 @@ int32_t startServer(const char* serverId, CommandCallback callback) {
 }  // namespace
 
 int32_t server_recv_data(int fd, void* buf, int32_t len) {
-    VOK_LOGD("Entry - Recv buf len:%d", len);
-    if (fd < 0 || buf == nullptr || len < 1) {
-        std::printf("[%s]:%s() - Invalid argument\n", LOG_TAG, "server_recv_data");
-        return CHANNEL_INVALID_ARGUMENTS;
-    }
-    uint8_t* p = static_cast<uint8_t*>(buf);
-    int32_t remaining = len;
-    while (remaining > 0) {
-        ssize_t n = vokcomm::recvRetrying(fd, p, static_cast<size_t>(remaining), 0);
-        VOK_LOGD("Bytes read:%d", static_cast<int>(n));
-        if (n < 1) return exitWith(n < 0 ? CHANNEL_SERVER_IO_FAILED : CHANNEL_SERVER_PEER_CLOSED);
-        p += n;
-        remaining -= static_cast<int32_t>(n);
-    }
-    return exitWith(CHANNEL_OK);
+    vokcomm::ReceiveStage unstaged(0);
+    return receive(fd, unstaged, buf, len);
 }
 
 int32_t server_send_data(int fd, const void* buf, int32_t len) {

@@ -20,4 +20,12 @@ typedef struct ModuleEntry {
 VOK_C_API ModuleEntry* getModuleEntryByName(const char* name);
 VOK_C_API CK_FUNCTION_LIST_PTR getFunctionsByModule(const char* name);
 
+// For the server thread, which looks its module up for every command: attaches
+// the calling thread to the Java VM once, as a daemon thread, and leaves it
+// attached, so that its lookups find their JNI environment at once. Any other
+// native thread is still attached and detached around each lookup. Returns 1
+// when the thread is attached (now or before), 0 without a Java VM or when the
+// VM refuses. Not exported.
+VOK_EXTERN_C int keepThreadAttachedToJavaVm(void);
+
 #endif

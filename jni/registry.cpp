@@ -127,7 +127,8 @@ struct ThreadEnv {
     bool attached = false;  // attached here, so detached here too
 };
 
-// Native callers (the server thread) may have no JNI environment yet.
+// Native callers may have no JNI environment; the server thread keeps one
+// (keepThreadAttachedToJavaVm).
 ThreadEnv envForCurrentThread() {
     JavaVM* vm = gJavaVM;
     void* existing = nullptr;
@@ -264,6 +265,21 @@ ModuleEntry* getModuleEntryByName(const char* name) {
     ModuleEntry* entry = findByName(thread.env, name);
     if (thread.attached) gJavaVM->DetachCurrentThread();
     return entry;
+}
+
+int keepThreadAttachedToJavaVm(void) {
+    JavaVM* vm = gJavaVM;
+    void* env = nullptr;
+    if (vm == nullptr) return 0;
+    if (vm->GetEnv(&env, kJniVersion) == JNI_OK) return 1;
+    // This departs from the rule above for native threads (attach and detach
+    // around each lookup), for the server thread only: it looks its module up
+    // for every command, and an attach and detach per command cost tens of
+    // microseconds and an error line each time. Attached once, as a daemon
+    // thread so that it never holds up the VM's shutdown, and never detached,
+    // it finds its environment in getModuleEntryByName like a Java thread.
+    JavaVMAttachArgs args = {kJniVersion, const_cast<char*>("vokpkcs11 server"), nullptr};
+    return vm->AttachCurrentThreadAsDaemon(&env, &args) == JNI_OK ? 1 : 0;
 }
 
 CK_FUNCTION_LIST_PTR getFunctionsByModule(const char* name) {

@@ -6,6 +6,7 @@
 #include <new>
 #include <string>
 
+#include "comm_internal.h"
 #include "handler_frame.h"
 #include "marshal.h"
 #include "vok_comm.h"
@@ -102,16 +103,30 @@ const Command kCommands[] = {
 };
 
 // No command name ever matches "C_GetFunctionList": the client serves it.
-std::string dispatch(const std::string& request) {
-    operation.ParseFromString(request);  // a malformed request simply matches nothing
+std::string dispatch(const void* request, int32_t length) {
+    // A malformed request simply matches nothing.
+    operation.ParseFromArray(request, request != nullptr && length > 0 ? length : 0);
     ckpFunctions = getFunctionsByModule(mModuleName);
     const char* name = operation.name().c_str();
     for (const Command& command : kCommands) {
         if (std::strcmp(name, command.name) != 0) continue;
         VOK_LOGD("Generate_Operation_Result %s", command.name);
-        return command.handler(request);
+        // The handler finds the request parsed already: a large one is not
+        // copied and parsed a second time.
+        vok::server::ParsedRequest parsed;
+        return command.handler(std::string());
     }
     return std::string();
+}
+
+// The server thread looks its module up for every command. It attaches itself
+// to the Java VM on its first command and stays attached, where the registry
+// would attach and detach it around each lookup (as it still does for any other
+// native thread): see keepThreadAttachedToJavaVm.
+void keepServerThreadAttached() {
+    static thread_local bool attached = false;
+    if (!attached && pthread_equal(pthread_self(), vokcomm::serverThread()))
+        attached = keepThreadAttachedToJavaVm() == 1;
 }
 
 }  // namespace
@@ -144,12 +159,10 @@ int32_t setModuleName_Server(const char* name) {
 int32_t Generate_Operation_Result_Server(const void* request, int32_t requestLength,
                                          void** response, uint32_t* responseLength) {
     if (response == nullptr || responseLength == nullptr) return 0;
+    keepServerThreadAttached();
     std::string result;
     try {
-        std::string bytes;
-        if (request != nullptr && requestLength > 0)
-            bytes.assign(static_cast<const char*>(request), static_cast<size_t>(requestLength));
-        result = dispatch(bytes);
+        result = dispatch(request, requestLength);
     } catch (...) {
         // Out of memory before a handler ran: answered like an unknown command.
         result.clear();

@@ -19,6 +19,20 @@ std::string serialised(const pkcs11::OperationResult& response);
 // The answer to a request the module was not called for: name and code only.
 std::string refused(const char* responseName, CK_RV result) noexcept;
 
+// While one lives, `operation` already holds the request the handler is given,
+// and serve() does not parse it again.
+class ParsedRequest {
+public:
+    ParsedRequest() { parsed() = true; }
+    ~ParsedRequest() { parsed() = false; }
+    ParsedRequest(const ParsedRequest&) = delete;
+    ParsedRequest& operator=(const ParsedRequest&) = delete;
+    static bool& parsed() {
+        static bool value = false;
+        return value;
+    }
+};
+
 // body(pkcs11::OperationResult&) reads the request sub-message from
 // `operation`, stores the module's return value in `rv` and fills the answer's
 // sub-message whatever `rv` is. A Refusal it throws is answered with its code;
@@ -28,7 +42,7 @@ std::string refused(const char* responseName, CK_RV result) noexcept;
 template <class Body>
 std::string serve(const std::string& request, const char* responseName, Body&& body) noexcept {
     try {
-        operation.ParseFromString(request);
+        if (!ParsedRequest::parsed()) operation.ParseFromString(request);
         if (ckpFunctions == nullptr) return std::string();
         pkcs11::OperationResult response;
         response.set_name(responseName);

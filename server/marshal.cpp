@@ -47,11 +47,20 @@ std::string leading(const Bytes& buffer, CK_ULONG length) {
 
 Input::Input(Sent<std::string> sent, uint64_t length) {
     Bytes::checkCount(length);
-    if (sent.present) bytes_.emplace(fromRequest(sent.value, length));
+    if (!sent.present) return;
+    if (sent.value.size() >= length) {
+        borrowed_ = reinterpret_cast<CK_BYTE_PTR>(const_cast<char*>(sent.value.data()));
+        borrowedLength_ = length;
+    } else {
+        bytes_.emplace(fromRequest(sent.value, length));
+    }
 }
 
 std::string Input::leading(CK_ULONG length) const {
-    return bytes_ ? server::leading(*bytes_, length) : std::string();
+    if (bytes_) return server::leading(*bytes_, length);
+    if (borrowed_ == nullptr) return std::string();
+    return std::string(reinterpret_cast<const char*>(borrowed_),
+                       static_cast<size_t>(std::min<uint64_t>(length, borrowedLength_)));
 }
 
 Output::Output(bool present, uint64_t capacity) : length_(capacity) {

@@ -104,11 +104,16 @@ Sent<T> sent(bool present, const T& value) {
 class Input {
 public:
     Input(Sent<std::string> sent, uint64_t length);
-    CK_BYTE_PTR data() const { return bytes_ ? bytes_->data() : nullptr; }
+    CK_BYTE_PTR data() const { return bytes_ ? bytes_->data() : borrowed_; }
     // The first `length` bytes as they stand now; empty for NULL.
     std::string leading(CK_ULONG length) const;
 
 private:
+    // The request's own bytes, when they cover the stated length: the module
+    // reads (C_GenerateRandom writes) no further than that length, and a large
+    // input is not copied once more on its way to the module.
+    CK_BYTE_PTR borrowed_ = nullptr;
+    uint64_t borrowedLength_ = 0;
     std::optional<Bytes> bytes_;
 };
 

@@ -452,6 +452,27 @@ TEST_F(ServerChannelTest, IdsDifferingOnlyInTheirFirstCharacterMeet) {
     EXPECT_EQ(0, status);
 }
 
+// Requests and answers around the sizes of both ends' receive stages (64 KiB
+// on the server, 16 KiB at the client) and beyond a socket's buffer, back to
+// back: each arrives whole, alone, and in its own exchange.
+TEST_F(ServerChannelTest, FramesOfEverySizeAroundTheReceiveStagesArriveWhole) {
+    commandHandler = [](const Bytes& request, void** response, uint32_t* length) {
+        Bytes reversed(request.rbegin(), request.rend());
+        return answer(reversed, response, length);
+    };
+    startServer(id);
+    ASSERT_EQ(0, vokpkcs11_comm_client_init(id.c_str()));
+    for (size_t size : {1, 15, 16, 17, 16367, 16368, 16369, 16384, 65519, 65520, 65521, 65536,
+                        (1 << 20) + 3, 2, 65537}) {
+        std::string request(size, '\0');
+        for (size_t i = 0; i < size; ++i) request[i] = static_cast<char>(i * 7 + size);
+        int32_t status = -1;
+        const std::string text = exchangeText(request, &status);
+        EXPECT_EQ(0, status) << size;
+        EXPECT_TRUE(text == std::string(request.rbegin(), request.rend())) << size;
+    }
+}
+
 TEST_F(ServerChannelTest, ConcurrentExchangesAreNeverMixedUp) {
     std::atomic<int> inCallback{0};
     std::atomic<bool> overlapped{false};

@@ -446,14 +446,51 @@ TEST_F(Registry, NativeThreadStaysAttachedWhenTheLibraryIsNotInitialised) {
     EXPECT_FALSE(log.contains(kTag, kNoAttachLine));
 }
 
+bool currentThreadIsDaemon(JNIEnv* env) {
+    jclass thread = env->FindClass("java/lang/Thread");
+    jmethodID current = env->GetStaticMethodID(thread, "currentThread", "()Ljava/lang/Thread;");
+    jobject self = env->CallStaticObjectMethod(thread, current);
+    if (env->ExceptionCheck()) return false;
+    const jboolean daemon = env->CallBooleanMethod(self, env->GetMethodID(thread, "isDaemon", "()Z"));
+    return !env->ExceptionCheck() && daemon == JNI_TRUE;
+}
+
+// The server thread's way: attached once, as a daemon, it stays attached
+// through its lookups, which then find their environment without error lines.
+TEST_F(Registry, AThreadKeptAttachedIsADaemonThatLooksUpWithoutErrorLines) {
+    add("alpha", &gListA);
+    LogCapture log;
+    int first = -1, again = -1;
+    bool daemon = false;
+    CK_FUNCTION_LIST_PTR found = nullptr;
+    jint after = JNI_EDETACHED;
+    std::thread([&] {
+        first = keepThreadAttachedToJavaVm();
+        again = keepThreadAttachedToJavaVm();
+        found = getFunctionsByModule("alpha");
+        after = envState();
+        if (after != JNI_OK) return;
+        daemon = currentThreadIsDaemon(voktest::currentEnv());
+        voktest::javaVM()->DetachCurrentThread();
+    }).join();
+    EXPECT_EQ(first, 1);
+    EXPECT_EQ(again, 1);
+    EXPECT_EQ(found, &gListA);
+    EXPECT_EQ(after, JNI_OK);
+    EXPECT_TRUE(daemon);
+    EXPECT_FALSE(log.contains(kTag, kNoEnvLine));
+}
+
 TEST_F(Registry, NameLookupWithoutAVmGivesUp) {
     add("alpha", &gListA);
     JavaVM* vm = gJavaVM;
     gJavaVM = nullptr;
     LogCapture log;
     ModuleEntry* found = getModuleEntryByName("alpha");
+    const int attached = keepThreadAttachedToJavaVm();
     gJavaVM = vm;
     EXPECT_EQ(found, nullptr);
+    EXPECT_EQ(attached, 0);
     EXPECT_THAT(log.lines(), ElementsAre(debug("module name passed alpha"), error(kNoEnvLine),
                                          error(kNoAttachLine)));
 }
