@@ -94,10 +94,8 @@ struct Context {
     bool alreadyInitialized = false;
     CK_SESSION_HANDLE session = CK_INVALID_HANDLE;
     CK_OBJECT_HANDLE object = CK_INVALID_HANDLE;
-    CK_OBJECT_HANDLE copy = CK_INVALID_HANDLE;
-    CK_OBJECT_HANDLE aes = CK_INVALID_HANDLE, secret = CK_INVALID_HANDLE;
-    CK_OBJECT_HANDLE publicKey = CK_INVALID_HANDLE, privateKey = CK_INVALID_HANDLE;
-    std::string ciphertext, digest, signature;
+    CK_OBJECT_HANDLE aes = CK_INVALID_HANDLE;
+    std::string ciphertext;
 };
 
 // A step fails with a Failure: the rv of a call or an output was not as expected.
@@ -149,14 +147,6 @@ std::string text(const CK_BYTE* bytes, CK_ULONG length) {
     return std::string(reinterpret_cast<const char*>(bytes), length);
 }
 
-// A final that has nothing left to return.
-void finish(Context& c, const char* name, CK_C_EncryptFinal call) {
-    CK_BYTE last[32] = {0};
-    CK_ULONG length = sizeof last;
-    expectRv(name, call(c.session, last, &length), CKR_OK);
-    expectTrue(length == 0, std::string(name) + " returned bytes");
-}
-
 // Runs an in/out data function on `input` into a 32-byte buffer.
 std::string update(Context& c, const char* name, CK_C_EncryptUpdate call,
                    const std::string& input) {
@@ -178,11 +168,9 @@ const char kObjectValue[] = "hello";
 const std::string kPlain = "sixteen byte msg";
 CK_BYTE kIv[16] = {1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 13, 14, 15, 16};
 CK_MECHANISM kCbc = {CKM_AES_CBC, kIv, sizeof kIv};
-CK_MECHANISM kSha256 = {CKM_SHA256, nullptr, 0};
-CK_MECHANISM kHmac = {CKM_MD5_HMAC, nullptr, 0};
 
-// The table, in the order a real application would call. Every function the
-// service can serve has a step; new handlers get theirs here.
+// The table, in the order a real application would call: enough of a session
+// to show a service at work. Each function's own rules are the unit tests'.
 const std::vector<Step>& steps() {
     static const std::vector<Step> table = {
         {"C_Initialize",
@@ -199,62 +187,6 @@ const std::vector<Step>& steps() {
              expectTrue(startsWith(info.manufacturerID, "Vok test vendor"), "manufacturerID");
              expectTrue(info.libraryVersion.minor == 2, "libraryVersion.minor is not 2");
          }},
-        {"C_GetSlotList",
-         [](Context& c) {
-             CK_ULONG count = 0;
-             expectRv("C_GetSlotList (count)", c.f->C_GetSlotList(CK_TRUE, nullptr, &count),
-                      CKR_OK);
-             expectTrue(count == 1, "slot count " + std::to_string(count));
-             CK_SLOT_ID slots[1] = {0};
-             expectRv("C_GetSlotList", c.f->C_GetSlotList(CK_TRUE, slots, &count), CKR_OK);
-             expectTrue(count == 1 && slots[0] == 1, "slot list");
-         }},
-        {"C_GetSlotInfo",
-         [](Context& c) {
-             CK_SLOT_INFO info{};
-             expectRv("C_GetSlotInfo", c.f->C_GetSlotInfo(1, &info), CKR_OK);
-             expectTrue((info.flags & CKF_TOKEN_PRESENT) != 0, "no token present");
-             expectTrue(info.firmwareVersion.major == 5 && info.firmwareVersion.minor == 6,
-                        "firmwareVersion");
-         }},
-        {"C_GetTokenInfo",
-         [](Context& c) {
-             CK_TOKEN_INFO info{};
-             expectRv("C_GetTokenInfo", c.f->C_GetTokenInfo(1, &info), CKR_OK);
-             expectTrue(startsWith(info.model, "Fake token"), "model");
-             expectTrue(startsWith(info.serialNumber, "FAKE-1"), "serialNumber");
-             expectTrue((info.flags & CKF_TOKEN_INITIALIZED) != 0, "token not initialized");
-             expectTrue(info.ulMaxPinLen == 8 && info.ulFreePrivateMemory == 8192, "counters");
-         }},
-        {"C_GetMechanismList",
-         [](Context& c) {
-             CK_ULONG count = 0;
-             expectRv("C_GetMechanismList (count)", c.f->C_GetMechanismList(1, nullptr, &count),
-                      CKR_OK);
-             expectTrue(count > 0, "no mechanisms");
-             std::vector<CK_MECHANISM_TYPE> types(count);
-             expectRv("C_GetMechanismList", c.f->C_GetMechanismList(1, types.data(), &count),
-                      CKR_OK);
-             expectTrue(std::find(types.begin(), types.end(), CKM_SHA256) != types.end(),
-                        "no CKM_SHA256");
-         }},
-        {"C_GetMechanismInfo",
-         [](Context& c) {
-             CK_MECHANISM_INFO info{};
-             expectRv("C_GetMechanismInfo", c.f->C_GetMechanismInfo(1, CKM_AES_ECB, &info), CKR_OK);
-             expectTrue(info.ulMinKeySize == 16 && info.ulMaxKeySize == 32 &&
-                            (info.flags & CKF_ENCRYPT) != 0,
-                        "CKM_AES_ECB info");
-         }},
-        {"C_InitToken",
-         [](Context& c) {
-             // A wrong SO PIN: the token must stay as it is for the steps after.
-             CK_UTF8CHAR label[33];
-             std::memset(label, ' ', 32);
-             label[32] = 0;
-             CK_UTF8CHAR pin[] = "0000";
-             expectRv("C_InitToken", c.f->C_InitToken(1, pin, 4, label), CKR_PIN_INCORRECT);
-         }},
         {"C_OpenSession",
          [](Context& c) {
              expectRv("C_OpenSession",
@@ -262,27 +194,6 @@ const std::vector<Step>& steps() {
                                          &c.session),
                       CKR_OK);
              expectTrue(c.session != CK_INVALID_HANDLE, "no session handle");
-         }},
-        {"C_GetSessionInfo",
-         [](Context& c) {
-             CK_SESSION_INFO info{};
-             expectRv("C_GetSessionInfo", c.f->C_GetSessionInfo(c.session, &info), CKR_OK);
-             expectTrue(info.slotID == 1 && info.state == CKS_RW_PUBLIC_SESSION &&
-                            (info.flags & CKF_RW_SESSION) != 0,
-                        "session info");
-         }},
-        // The proxies send "C_InitPIN" and "C_SetPIN", names the service does
-        // not serve: the empty answer reaches the caller as all ones.
-        {"C_InitPIN",
-         [](Context& c) {
-             CK_UTF8CHAR pin[] = "4321";
-             expectRv("C_InitPIN", c.f->C_InitPIN(c.session, pin, 4), kChannelFailure);
-         }},
-        {"C_SetPIN",
-         [](Context& c) {
-             CK_UTF8CHAR oldPin[] = "1234";
-             CK_UTF8CHAR newPin[] = "4321";
-             expectRv("C_SetPIN", c.f->C_SetPIN(c.session, oldPin, 4, newPin, 4), kChannelFailure);
          }},
         {"C_Login",
          [](Context& c) {
@@ -307,89 +218,19 @@ const std::vector<Step>& steps() {
              // Handles above 32 bits: a truncating hop would hand back another.
              expectTrue(c.object > 0xFFFFFFFFUL, "object handle " + std::to_string(c.object));
          }},
-        {"C_GetObjectSize",
-         [](Context& c) {
-             CK_ULONG size = 0;
-             expectRv("C_GetObjectSize", c.f->C_GetObjectSize(c.session, c.object, &size), CKR_OK);
-             expectTrue(size > 0, "object size 0");
-         }},
         {"C_GetAttributeValue",
          [](Context& c) {
              expectTrue(readAttribute(c, c.object, CKA_LABEL) == kObjectLabel, "label");
              expectTrue(readAttribute(c, c.object, CKA_VALUE) == kObjectValue, "value");
          }},
-        {"C_SetAttributeValue",
+        {"C_GenerateKey",
          [](Context& c) {
-             const char label[] = "renamed";
-             CK_ATTRIBUTE change = attribute(CKA_LABEL, label, sizeof label - 1);
-             expectRv("C_SetAttributeValue",
-                      c.f->C_SetAttributeValue(c.session, c.object, &change, 1), CKR_OK);
-             expectTrue(readAttribute(c, c.object, CKA_LABEL) == label, "label not changed");
-         }},
-        {"C_CopyObject",
-         [](Context& c) {
-             const char label[] = "copy";
-             CK_ATTRIBUTE change = attribute(CKA_LABEL, label, sizeof label - 1);
-             expectRv("C_CopyObject", c.f->C_CopyObject(c.session, c.object, &change, 1, &c.copy),
-                      CKR_OK);
-             expectTrue(c.copy != CK_INVALID_HANDLE && c.copy != c.object, "copy handle");
-             expectTrue(readAttribute(c, c.copy, CKA_VALUE) == kObjectValue, "copied value");
-         }},
-        {"C_FindObjectsInit/C_FindObjects/C_FindObjectsFinal",
-         [](Context& c) {
-             CK_OBJECT_CLASS dataClass = CKO_DATA;
-             CK_ATTRIBUTE filter = attribute(CKA_CLASS, &dataClass, sizeof dataClass);
-             expectRv("C_FindObjectsInit", c.f->C_FindObjectsInit(c.session, &filter, 1), CKR_OK);
-             CK_OBJECT_HANDLE found[10] = {0};
-             CK_ULONG count = 0;
-             expectRv("C_FindObjects", c.f->C_FindObjects(c.session, found, 10, &count), CKR_OK);
-             std::vector<CK_OBJECT_HANDLE> handles(found, found + std::min<CK_ULONG>(count, 10));
-             std::sort(handles.begin(), handles.end());
-             std::vector<CK_OBJECT_HANDLE> expected = {c.object, c.copy};
-             std::sort(expected.begin(), expected.end());
-             expectTrue(handles == expected, "found " + std::to_string(count) + " objects");
-             expectRv("C_FindObjectsFinal", c.f->C_FindObjectsFinal(c.session), CKR_OK);
-         }},
-        {"C_DestroyObject",
-         [](Context& c) {
-             expectRv("C_DestroyObject", c.f->C_DestroyObject(c.session, c.copy), CKR_OK);
-             CK_ULONG size = 0;
-             expectRv("C_GetObjectSize (destroyed)", c.f->C_GetObjectSize(c.session, c.copy, &size),
-                      CKR_OBJECT_HANDLE_INVALID);
-         }},
-        {"C_GetOperationState",
-         [](Context& c) {
-             // No operation is active yet; the buffer goes out as a C string.
-             CK_BYTE state[64] = {0};
-             CK_ULONG length = sizeof state;
-             expectRv("C_GetOperationState", c.f->C_GetOperationState(c.session, state, &length),
-                      CKR_OPERATION_NOT_INITIALIZED);
-         }},
-        {"C_SetOperationState",
-         [](Context& c) {
-             CK_BYTE junk[] = {1, 2, 3, 4};
-             expectRv("C_SetOperationState",
-                      c.f->C_SetOperationState(c.session, junk, sizeof junk, CK_INVALID_HANDLE,
-                                               CK_INVALID_HANDLE),
-                      CKR_SAVED_STATE_INVALID);
-         }},
-        {"C_GenerateKey/C_GenerateKeyPair",
-         [](Context& c) {
-             CK_ULONG length = 16, bits = 512;
+             CK_ULONG length = 16;
              CK_ATTRIBUTE valueLen = attribute(CKA_VALUE_LEN, &length, sizeof length);
-             CK_ATTRIBUTE modulusBits = attribute(CKA_MODULUS_BITS, &bits, sizeof bits);
              CK_MECHANISM aes = {CKM_AES_KEY_GEN, nullptr, 0};
-             CK_MECHANISM secret = {CKM_GENERIC_SECRET_KEY_GEN, nullptr, 0};
-             CK_MECHANISM rsa = {CKM_RSA_PKCS_KEY_PAIR_GEN, nullptr, 0};
              expectRv("C_GenerateKey", c.f->C_GenerateKey(c.session, &aes, &valueLen, 1, &c.aes),
                       CKR_OK);
-             expectRv("C_GenerateKey",
-                      c.f->C_GenerateKey(c.session, &secret, &valueLen, 1, &c.secret), CKR_OK);
-             expectRv("C_GenerateKeyPair",
-                      c.f->C_GenerateKeyPair(c.session, &rsa, &modulusBits, 1, nullptr, 0,
-                                             &c.publicKey, &c.privateKey),
-                      CKR_OK);
-             expectTrue(c.aes > 0xFFFFFFFFUL && c.privateKey > c.publicKey, "key handles");
+             expectTrue(c.aes > 0xFFFFFFFFUL, "key handle " + std::to_string(c.aes));
          }},
         {"C_EncryptInit/C_Encrypt",
          [](Context& c) {
@@ -411,198 +252,11 @@ const std::vector<Step>& steps() {
                       c.f->C_Decrypt(c.session, in.data(), in.size(), out.data(), &length), CKR_OK);
              expectTrue(text(out.data(), length) == kPlain, "round trip");
          }},
-        // A length query on an update sends capacity 0, and the service still
-        // hands the module the whole input.
-        {"C_EncryptUpdate/C_EncryptFinal/C_DecryptUpdate/C_DecryptFinal",
-         [](Context& c) {
-             expectRv("C_EncryptInit", c.f->C_EncryptInit(c.session, &kCbc, c.aes), CKR_OK);
-             std::vector<CK_BYTE> in(kPlain.begin(), kPlain.end());
-             CK_ULONG length = 0;
-             expectRv("C_EncryptUpdate (length)",
-                      c.f->C_EncryptUpdate(c.session, in.data(), in.size(), nullptr, &length),
-                      CKR_OK);
-             expectTrue(length == 16, "update length " + std::to_string(length));
-             expectTrue(update(c, "C_EncryptUpdate", c.f->C_EncryptUpdate, kPlain) == c.ciphertext,
-                        "multi-part ciphertext");
-             finish(c, "C_EncryptFinal", c.f->C_EncryptFinal);
-             expectRv("C_DecryptInit", c.f->C_DecryptInit(c.session, &kCbc, c.aes), CKR_OK);
-             expectTrue(update(c, "C_DecryptUpdate", c.f->C_DecryptUpdate, c.ciphertext) == kPlain,
-                        "multi-part plaintext");
-             finish(c, "C_DecryptFinal", c.f->C_DecryptFinal);
-         }},
-        {"C_DigestInit/C_Digest/C_DigestUpdate/C_DigestKey/C_DigestFinal",
-         [](Context& c) {
-             expectRv("C_DigestInit", c.f->C_DigestInit(c.session, &kSha256), CKR_OK);
-             c.digest = update(c, "C_Digest", c.f->C_Digest, kPlain);
-             expectTrue(c.digest.size() == 32, "digest length");
-             expectRv("C_DigestInit", c.f->C_DigestInit(c.session, &kSha256), CKR_OK);
-             std::vector<CK_BYTE> in(kPlain.begin(), kPlain.end());
-             expectRv("C_DigestUpdate", c.f->C_DigestUpdate(c.session, in.data(), in.size()),
-                      CKR_OK);
-             expectRv("C_DigestKey", c.f->C_DigestKey(c.session, c.secret), CKR_OK);
-             CK_BYTE out[32] = {0};
-             CK_ULONG length = sizeof out;
-             expectRv("C_DigestFinal", c.f->C_DigestFinal(c.session, out, &length), CKR_OK);
-             expectTrue(length == 32 && text(out, length) != c.digest, "keyed digest");
-         }},
-        {"C_SignInit/C_Sign/C_SignUpdate/C_SignFinal",
-         [](Context& c) {
-             expectRv("C_SignInit", c.f->C_SignInit(c.session, &kHmac, c.secret), CKR_OK);
-             c.signature = update(c, "C_Sign", c.f->C_Sign, kPlain);
-             expectTrue(c.signature.size() == 16, "signature length");
-             expectRv("C_SignInit", c.f->C_SignInit(c.session, &kHmac, c.secret), CKR_OK);
-             std::vector<CK_BYTE> in(kPlain.begin(), kPlain.end());
-             expectRv("C_SignUpdate", c.f->C_SignUpdate(c.session, in.data(), in.size()), CKR_OK);
-             CK_BYTE out[16] = {0};
-             CK_ULONG length = sizeof out;
-             expectRv("C_SignFinal", c.f->C_SignFinal(c.session, out, &length), CKR_OK);
-             expectTrue(text(out, length) == c.signature, "multi-part signature");
-         }},
-        // C_Verify's signature never reaches the module (the service checks a
-        // zero-filled one), so only the multi-part form can succeed.
-        {"C_VerifyInit/C_Verify/C_VerifyUpdate/C_VerifyFinal",
-         [](Context& c) {
-             std::vector<CK_BYTE> in(kPlain.begin(), kPlain.end());
-             std::vector<CK_BYTE> signature(c.signature.begin(), c.signature.end());
-             expectRv("C_VerifyInit", c.f->C_VerifyInit(c.session, &kHmac, c.secret), CKR_OK);
-             expectRv(
-                 "C_Verify",
-                 c.f->C_Verify(c.session, in.data(), in.size(), signature.data(), signature.size()),
-                 CKR_SIGNATURE_INVALID);
-             signature.assign(c.signature.begin(), c.signature.end());
-             expectRv("C_VerifyInit", c.f->C_VerifyInit(c.session, &kHmac, c.secret), CKR_OK);
-             expectRv("C_VerifyUpdate", c.f->C_VerifyUpdate(c.session, in.data(), in.size()),
-                      CKR_OK);
-             expectRv("C_VerifyFinal",
-                      c.f->C_VerifyFinal(c.session, signature.data(), signature.size()), CKR_OK);
-         }},
-        {"C_SignRecoverInit/C_SignRecover/C_VerifyRecoverInit/C_VerifyRecover",
-         [](Context& c) {
-             CK_MECHANISM x509 = {CKM_RSA_X_509, nullptr, 0};
-             expectRv("C_SignRecoverInit", c.f->C_SignRecoverInit(c.session, &x509, c.privateKey),
-                      CKR_OK);
-             const std::string recoverable = update(c, "C_SignRecover", c.f->C_SignRecover, kPlain);
-             expectTrue(recoverable.size() == 17, "recoverable signature length");
-             expectRv("C_VerifyRecoverInit",
-                      c.f->C_VerifyRecoverInit(c.session, &x509, c.publicKey), CKR_OK);
-             expectTrue(update(c, "C_VerifyRecover", c.f->C_VerifyRecover, recoverable) == kPlain,
-                        "recovered data");
-         }},
-        {"C_DigestEncryptUpdate/C_DecryptDigestUpdate/C_SignEncryptUpdate/C_DecryptVerifyUpdate",
-         [](Context& c) {
-             auto finalBytes = [&c](const char* name, CK_C_DigestFinal call) {
-                 CK_BYTE out[32] = {0};
-                 CK_ULONG length = sizeof out;
-                 expectRv(name, call(c.session, out, &length), CKR_OK);
-                 return text(out, std::min<CK_ULONG>(length, sizeof out));
-             };
-             expectRv("C_DigestInit", c.f->C_DigestInit(c.session, &kSha256), CKR_OK);
-             expectRv("C_EncryptInit", c.f->C_EncryptInit(c.session, &kCbc, c.aes), CKR_OK);
-             expectTrue(update(c, "C_DigestEncryptUpdate", c.f->C_DigestEncryptUpdate, kPlain) ==
-                            c.ciphertext,
-                        "digest-encrypt ciphertext");
-             finish(c, "C_EncryptFinal", c.f->C_EncryptFinal);
-             expectTrue(finalBytes("C_DigestFinal", c.f->C_DigestFinal) == c.digest,
-                        "digest-encrypt digest");
-             expectRv("C_DecryptInit", c.f->C_DecryptInit(c.session, &kCbc, c.aes), CKR_OK);
-             expectRv("C_DigestInit", c.f->C_DigestInit(c.session, &kSha256), CKR_OK);
-             expectTrue(update(c, "C_DecryptDigestUpdate", c.f->C_DecryptDigestUpdate,
-                               c.ciphertext) == kPlain,
-                        "decrypt-digest plaintext");
-             finish(c, "C_DecryptFinal", c.f->C_DecryptFinal);
-             expectTrue(finalBytes("C_DigestFinal", c.f->C_DigestFinal) == c.digest,
-                        "decrypt-digest digest");
-             expectRv("C_SignInit", c.f->C_SignInit(c.session, &kHmac, c.secret), CKR_OK);
-             expectRv("C_EncryptInit", c.f->C_EncryptInit(c.session, &kCbc, c.aes), CKR_OK);
-             expectTrue(
-                 update(c, "C_SignEncryptUpdate", c.f->C_SignEncryptUpdate, kPlain) == c.ciphertext,
-                 "sign-encrypt ciphertext");
-             finish(c, "C_EncryptFinal", c.f->C_EncryptFinal);
-             expectTrue(finalBytes("C_SignFinal", c.f->C_SignFinal) == c.signature,
-                        "sign-encrypt signature");
-             expectRv("C_DecryptInit", c.f->C_DecryptInit(c.session, &kCbc, c.aes), CKR_OK);
-             expectRv("C_VerifyInit", c.f->C_VerifyInit(c.session, &kHmac, c.secret), CKR_OK);
-             expectTrue(update(c, "C_DecryptVerifyUpdate", c.f->C_DecryptVerifyUpdate,
-                               c.ciphertext) == kPlain,
-                        "decrypt-verify plaintext");
-             finish(c, "C_DecryptFinal", c.f->C_DecryptFinal);
-             std::vector<CK_BYTE> signature(c.signature.begin(), c.signature.end());
-             expectRv("C_VerifyFinal",
-                      c.f->C_VerifyFinal(c.session, signature.data(), signature.size()), CKR_OK);
-         }},
-        {"C_WrapKey/C_UnwrapKey/C_DeriveKey",
-         [](Context& c) {
-             CK_MECHANISM ecb = {CKM_AES_ECB, nullptr, 0};
-             CK_ULONG length = 0;
-             expectRv("C_WrapKey (length)",
-                      c.f->C_WrapKey(c.session, &ecb, c.aes, c.secret, nullptr, &length), CKR_OK);
-             std::vector<CK_BYTE> wrapped(length);
-             expectRv("C_WrapKey",
-                      c.f->C_WrapKey(c.session, &ecb, c.aes, c.secret, wrapped.data(), &length),
-                      CKR_OK);
-             CK_OBJECT_CLASS secretClass = CKO_SECRET_KEY;
-             CK_ATTRIBUTE tmpl = attribute(CKA_CLASS, &secretClass, sizeof secretClass);
-             CK_OBJECT_HANDLE unwrapped = CK_INVALID_HANDLE, derived = CK_INVALID_HANDLE;
-             expectRv("C_UnwrapKey",
-                      c.f->C_UnwrapKey(c.session, &ecb, c.aes, wrapped.data(), length, &tmpl, 1,
-                                       &unwrapped),
-                      CKR_OK);
-             expectTrue(
-                 readAttribute(c, unwrapped, CKA_VALUE) == readAttribute(c, c.secret, CKA_VALUE),
-                 "unwrapped value");
-             // Answered as "C_UnDeriveKey", which the proxy does not mind.
-             CK_MECHANISM derivation = {CKM_SHA256_KEY_DERIVATION, nullptr, 0};
-             expectRv("C_DeriveKey",
-                      c.f->C_DeriveKey(c.session, &derivation, c.secret, nullptr, 0, &derived),
-                      CKR_OK);
-             expectTrue(readAttribute(c, derived, CKA_VALUE).size() == 32, "derived value");
-         }},
-        {"C_SeedRandom/C_GenerateRandom",
-         [](Context& c) {
-             CK_BYTE seed[] = "seed";
-             CK_BYTE random[16] = {0};
-             expectRv("C_SeedRandom", c.f->C_SeedRandom(c.session, seed, 4), CKR_OK);
-             expectRv("C_GenerateRandom", c.f->C_GenerateRandom(c.session, random, sizeof random),
-                      CKR_OK);
-             expectTrue(text(random, sizeof random) != std::string(16, '\0'), "no random bytes");
-         }},
-        {"C_GetFunctionStatus/C_CancelFunction",
-         [](Context& c) {
-             expectRv("C_GetFunctionStatus", c.f->C_GetFunctionStatus(c.session),
-                      CKR_FUNCTION_NOT_PARALLEL);
-             expectRv("C_CancelFunction", c.f->C_CancelFunction(c.session),
-                      CKR_FUNCTION_NOT_PARALLEL);
-         }},
-        {"C_WaitForSlotEvent",
-         [](Context& c) {
-             CK_SLOT_ID slot = 0;
-             expectRv("C_WaitForSlotEvent", c.f->C_WaitForSlotEvent(0, &slot, nullptr), CKR_OK);
-             expectTrue(slot == 1, "event slot " + std::to_string(slot));
-             expectRv("C_WaitForSlotEvent (no block)",
-                      c.f->C_WaitForSlotEvent(CKF_DONT_BLOCK, &slot, nullptr), CKR_NO_EVENT);
-         }},
-        {"C_Logout",
-         [](Context& c) {
-             expectRv("C_Logout", c.f->C_Logout(c.session), CKR_OK);
-             expectTrue(sessionState(c) == CKS_RW_PUBLIC_SESSION, "still logged in");
-         }},
         {"C_CloseSession",
          [](Context& c) {
              expectRv("C_CloseSession", c.f->C_CloseSession(c.session), CKR_OK);
              CK_SESSION_INFO info{};
              expectRv("C_GetSessionInfo (closed)", c.f->C_GetSessionInfo(c.session, &info),
-                      CKR_SESSION_HANDLE_INVALID);
-         }},
-        {"C_CloseAllSessions",
-         [](Context& c) {
-             CK_SESSION_HANDLE first = CK_INVALID_HANDLE, second = CK_INVALID_HANDLE;
-             expectRv("C_OpenSession",
-                      c.f->C_OpenSession(1, CKF_SERIAL_SESSION, nullptr, nullptr, &first), CKR_OK);
-             expectRv("C_OpenSession",
-                      c.f->C_OpenSession(1, CKF_SERIAL_SESSION, nullptr, nullptr, &second), CKR_OK);
-             expectRv("C_CloseAllSessions", c.f->C_CloseAllSessions(1), CKR_OK);
-             CK_SESSION_INFO info{};
-             expectRv("C_GetSessionInfo (closed)", c.f->C_GetSessionInfo(second, &info),
                       CKR_SESSION_HANDLE_INVALID);
          }},
         {"C_Finalize",

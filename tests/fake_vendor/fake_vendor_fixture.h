@@ -15,12 +15,6 @@ using Bytes = std::vector<CK_BYTE>;
 
 inline Bytes bytes(const std::string& s) { return Bytes(s.begin(), s.end()); }
 
-inline Bytes xorWith(const Bytes& data, const Bytes& key) {
-    Bytes out(data);
-    for (size_t i = 0; i < out.size(); ++i) out[i] ^= key[i % key.size()];
-    return out;
-}
-
 // A template whose values live as long as it does.
 class Template {
 public:
@@ -50,7 +44,6 @@ private:
 class FakeVendorTest : public ::testing::Test {
 public:
     const Bytes aesValue = bytes("0123456789abcdef");
-    const Bytes macValue = bytes("mac-key-material");
     CK_FUNCTION_LIST_PTR f = fake_vendor_function_list();
     CK_SESSION_HANDLE session = CK_INVALID_HANDLE;
 
@@ -81,26 +74,6 @@ public:
         return create(t);
     }
     CK_OBJECT_HANDLE aesKey() { return secretKey(CKK_AES, aesValue); }
-    CK_OBJECT_HANDLE macKey() { return secretKey(CKK_GENERIC_SECRET, macValue); }
-
-    // A single-part or final call's output, taken with the two-call convention.
-    template <typename Call>
-    Bytes collect(Call call) {
-        CK_ULONG len = 0;
-        EXPECT_EQ(call(nullptr, &len), CKR_OK);
-        Bytes out(len);
-        EXPECT_EQ(call(out.data(), &len), CKR_OK);
-        out.resize(len);
-        return out;
-    }
-
-    Bytes attribute(CK_OBJECT_HANDLE object, CK_ATTRIBUTE_TYPE type) {
-        Bytes value(256);
-        CK_ATTRIBUTE a{type, value.data(), value.size()};
-        EXPECT_EQ(f->C_GetAttributeValue(session, object, &a, 1), CKR_OK);
-        value.resize(a.ulValueLen <= value.size() ? a.ulValueLen : 0);
-        return value;
-    }
 };
 
 inline CK_MECHANISM mechanism(CK_MECHANISM_TYPE type) { return {type, nullptr, 0}; }

@@ -5,6 +5,23 @@
 namespace fakevendor {
 namespace {
 
+template <class... Args>
+CK_RV callWithZeros(CK_RV (*function)(Args...)) {
+    return function(Args{}...);
+}
+
+// Server tests read what arrived by function name: every entry must record
+// under its own.
+TEST_F(FakeVendorTest, EveryEntryRecordsUnderItsOwnName) {
+#define FAKE_RECORDS_ITS_NAME(name, params)                            \
+    if (std::string(#name) != "C_GetFunctionList") {                   \
+        callWithZeros(f->name);                                        \
+        EXPECT_EQ(#name, call(fake_vendor_call_count() - 1).function); \
+    }
+    VOK_CK_FUNCTIONS(FAKE_RECORDS_ITS_NAME)
+#undef FAKE_RECORDS_ITS_NAME
+}
+
 TEST_F(FakeVendorTest, RecordsScalarsNullnessCapacitiesAndContents) {
     const CK_OBJECT_HANDLE key = aesKey();
     CK_MECHANISM m = mechanism(CKM_AES_ECB);
