@@ -16,6 +16,7 @@
 #include <cstdlib>
 #include <fstream>
 #include <memory>
+#include <sstream>
 #include <string>
 #include <thread>
 #include <vector>
@@ -214,9 +215,15 @@ protected:
         const auto* info = ::testing::UnitTest::GetInstance()->current_test_info();
         // The first character never reaches the socket's name.
         serverId_ = std::string("Xvok-e2e-") + std::to_string(getpid()) + "-" + info->name();
-        host_.reset(new Process(
+        // Through env, which sets the sanitizer build's preloads for the host alone.
+        std::vector<std::string> argv = {"/usr/bin/env"};
+        std::istringstream environment(VOK_E2E_JAVA_ENVIRONMENT);
+        for (std::string setting; environment >> setting;) argv.push_back(setting);
+        argv.insert(
+            argv.end(),
             {VOK_E2E_JAVA, "-Djava.library.path=" + directoryOf(VOK_E2E_WRAPPER), "-cp",
-             VOK_E2E_JAR, "com.vok.smartcard.pkcs11.ServiceHost", serverId_, VOK_E2E_FAKE_VENDOR}));
+             VOK_E2E_JAR, "com.vok.smartcard.pkcs11.ServiceHost", serverId_, VOK_E2E_FAKE_VENDOR});
+        host_.reset(new Process(argv));
         ASSERT_EQ(host_->waitForLine("serving"), "serving " + serverId_) << host_->transcript();
     }
 
