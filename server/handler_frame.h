@@ -19,6 +19,15 @@ std::string serialised(const pkcs11::OperationResult& response);
 // The answer to a request the module was not called for: name and code only.
 std::string refused(const char* responseName, CK_RV result) noexcept;
 
+// The module's entry for one function. A list that leaves it NULL does not
+// offer the function: answered CKR_FUNCTION_NOT_SUPPORTED instead of calling
+// through NULL (a departure from forwarding every command blindly).
+template <class Function>
+Function offered(Function function) {
+    if (function == nullptr) throw Refusal{CKR_FUNCTION_NOT_SUPPORTED};
+    return function;
+}
+
 // body(pkcs11::OperationResult&) reads the request sub-message from
 // `operation`, stores the module's return value in `rv` and fills the answer's
 // sub-message whatever `rv` is. A Refusal it throws is answered with its code;
