@@ -96,9 +96,6 @@ public:
     ListMonitor& operator=(const ListMonitor&) = delete;
 
     bool held() const { return held_; }
-    // The node-allocation failure returns with the monitor still entered;
-    // that asymmetry is long-standing behaviour, kept on purpose.
-    void leaveEntered() { held_ = false; }
 
 private:
     JNIEnv* env_;
@@ -220,8 +217,9 @@ void putModuleEntry(JNIEnv* env, jobject key, ModuleEntry* entry) {
     }
     ModuleListNode* node = newNode(key, entry);
     if (node == nullptr) {
+        // Departs from the old failure path, which kept the monitor entered and
+        // so hung the server thread's next lookup: the monitor is released.
         throwOutOfMemoryError(env);
-        monitor.leaveEntered();
         return;
     }
     if (walk.node == nullptr)
