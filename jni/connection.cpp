@@ -212,9 +212,8 @@ void connect(JNIEnv* env, jobject thiz, jstring libraryNameString, jstring funct
 
 void disconnect(JNIEnv* env, jobject thiz) {
     VOK_LOGD("DEBUG: disconnecting module...");
-    ModuleEntry* entry = removeModuleEntry(env, thiz);
-    if (entry != nullptr && entry->libraryHandle != nullptr) dlclose(entry->libraryHandle);
-    std::free(entry);
+    // Closed once no call into the module is running any more.
+    unloadModuleEntry(removeModuleEntry(env, thiz));
     // Whatever role this process took: each deinit does nothing when its end
     // is not open.
     vokpkcs11_client_deinit();

@@ -5,6 +5,7 @@
 #include <cstring>
 
 #include "exceptions.h"
+#include "module_holds.h"
 #include "vok_log.h"
 
 JavaVM* gJavaVM = nullptr;
@@ -139,20 +140,55 @@ ThreadEnv envForCurrentThread() {
     return {static_cast<JNIEnv*>(attached), true};
 }
 
-ModuleEntry* findByName(JNIEnv* env, const char* name) {
+// With `hold`, the entry found is held before the monitor is released.
+ModuleEntry* findByName(JNIEnv* env, const char* name, bool hold) {
     ListMonitor monitor(env);
     if (!monitor.held() || moduleListHead == nullptr) return nullptr;
+    ModuleEntry* entry = nullptr;
     if (name == nullptr) {
         VOK_LOGD("found default entry");
-        return moduleListHead->entry;
-    }
-    Walk walk = walkByName(name);
-    if (walk.match == Match::Yes) {
+        entry = moduleListHead->entry;
+    } else {
+        Walk walk = walkByName(name);
+        if (walk.match != Match::Yes) {
+            VOK_LOGD("the entry is not in the list");
+            return nullptr;
+        }
         VOK_LOGD("found the entry");
-        return walk.node->entry;
+        entry = walk.node->entry;
     }
-    VOK_LOGD("the entry is not in the list");
-    return nullptr;
+    return !hold || holdModuleEntry(entry) ? entry : nullptr;
+}
+
+ModuleEntry* lookUpByName(const char* name, bool hold) {
+    if (name != nullptr)
+        VOK_LOGD("module name passed %s", name);
+    else
+        VOK_LOGD("module name passed NULL");
+
+    ThreadEnv thread = envForCurrentThread();
+    if (thread.env == nullptr) return nullptr;
+    // A thread attached above stays attached on this return; long-standing
+    // behaviour, kept.
+    if (moduleListLock == nullptr) return nullptr;
+
+    ModuleEntry* entry = findByName(thread.env, name, hold);
+    if (thread.attached) gJavaVM->DetachCurrentThread();
+    return entry;
+}
+
+CK_FUNCTION_LIST_PTR functionsOf(ModuleEntry* entry) {
+    if (entry == nullptr) {
+        // Logged twice: long-standing output, kept.
+        VOK_LOGD("failed getting module entry");
+        VOK_LOGD("failed getting module entry");
+        return nullptr;
+    }
+    if (entry->functionList == nullptr) {
+        VOK_LOGD("ckpFunctions is null %s", "getFunctionsByModule");
+        return nullptr;
+    }
+    return entry->functionList;
 }
 
 }  // namespace
@@ -247,37 +283,21 @@ int isModulePresent(JNIEnv* env, jobject obj) {
     return getModuleEntry(env, obj) != nullptr ? 1 : 0;
 }
 
-ModuleEntry* getModuleEntryByName(const char* name) {
-    if (name != nullptr)
-        VOK_LOGD("module name passed %s", name);
-    else
-        VOK_LOGD("module name passed NULL");
-
-    ThreadEnv thread = envForCurrentThread();
-    if (thread.env == nullptr) return nullptr;
-    // A thread attached above stays attached on this return; long-standing
-    // behaviour, kept.
-    if (moduleListLock == nullptr) return nullptr;
-
-    ModuleEntry* entry = findByName(thread.env, name);
-    if (thread.attached) gJavaVM->DetachCurrentThread();
-    return entry;
-}
+ModuleEntry* getModuleEntryByName(const char* name) { return lookUpByName(name, false); }
 
 CK_FUNCTION_LIST_PTR getFunctionsByModule(const char* name) {
-    VOK_LOGD(" %s", __func__);
-    ModuleEntry* entry = getModuleEntryByName(name);
-    if (entry == nullptr) {
-        // Logged twice: long-standing output, kept.
-        VOK_LOGD("failed getting module entry");
-        VOK_LOGD("failed getting module entry");
-        return nullptr;
-    }
-    if (entry->functionList == nullptr) {
-        VOK_LOGD("ckpFunctions is null %s", __func__);
-        return nullptr;
-    }
-    return entry->functionList;
+    VOK_LOGD(" %s", "getFunctionsByModule");
+    return functionsOf(getModuleEntryByName(name));
+}
+
+ModuleHold::ModuleHold(const char* name) {
+    VOK_LOGD(" %s", "getFunctionsByModule");
+    entry_ = lookUpByName(name, true);
+    functions_ = functionsOf(entry_);
+}
+
+ModuleHold::~ModuleHold() {
+    if (entry_ != nullptr) releaseModuleEntry(entry_);
 }
 
 ModuleEntry* removeModuleEntry(JNIEnv* env, jobject obj) {

@@ -167,7 +167,9 @@ private:
     template <class Call>
     CK_RV forward(const char* function, ResultLog log, Call&& call) const {
         VOK_LOGD("%s...", function);
-        CK_FUNCTION_LIST_PTR functions = getFunctionsByModule(moduleName);
+        // Held until the call returns: a disconnect meanwhile does not unload it.
+        ModuleHold module(moduleName);
+        CK_FUNCTION_LIST_PTR functions = module.functions();
         if (!functions) {
             VOK_LOGD("getFunctions return NULL");
             return CKR_FUNCTION_FAILED;

@@ -104,14 +104,20 @@ const Command kCommands[] = {
 // No command name ever matches "C_GetFunctionList": the client serves it.
 std::string dispatch(const std::string& request) {
     operation.ParseFromString(request);  // a malformed request simply matches nothing
-    ckpFunctions = getFunctionsByModule(mModuleName);
-    const char* name = operation.name().c_str();
+    const std::string name = operation.name().c_str();
+    // Departs from a bare lookup: the module stays loaded until the handler
+    // returns, even if disconnect takes it out of the registry meanwhile.
+    ModuleHold module(mModuleName);
+    ckpFunctions = module.functions();
+    std::string answer;
     for (const Command& command : kCommands) {
-        if (std::strcmp(name, command.name) != 0) continue;
+        if (name != command.name) continue;
         VOK_LOGD("Generate_Operation_Result %s", command.name);
-        return command.handler(request);
+        answer = command.handler(request);
+        break;
     }
-    return std::string();
+    ckpFunctions = nullptr;  // not to be used once the module is released
+    return answer;
 }
 
 }  // namespace
