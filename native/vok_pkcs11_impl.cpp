@@ -25,6 +25,7 @@ class VokPkcs11Impl final : public IVokPkcs11 {
 public:
     explicit VokPkcs11Impl(const char* name) : moduleName(name ? strdup(name) : nullptr) {}
     ~VokPkcs11Impl() override { free(moduleName); }
+    bool bound() const { return moduleName != nullptr; }
     VokPkcs11Impl(const VokPkcs11Impl&) = delete;
     VokPkcs11Impl& operator=(const VokPkcs11Impl&) = delete;
 
@@ -189,7 +190,13 @@ private:
 IVokPkcs11::~IVokPkcs11() {}
 
 IVokPkcs11* IVokPkcs11::getInstance(const char* moduleName) {
-    return new (std::nothrow) VokPkcs11Impl(moduleName);
+    VokPkcs11Impl* instance = new (std::nothrow) VokPkcs11Impl(moduleName);
+    // A name that could not be copied must not turn into "the first module".
+    if (instance != nullptr && moduleName != nullptr && !instance->bound()) {
+        delete instance;
+        return nullptr;
+    }
+    return instance;
 }
 
 CK_RV VokPkcs11Impl::C_Initialize(CK_VOID_PTR pInitArgs) {

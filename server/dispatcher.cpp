@@ -3,7 +3,9 @@
 
 #include <cstdlib>
 #include <cstring>
+#include <mutex>
 #include <new>
+#include <optional>
 #include <string>
 
 #include "handler_frame.h"
@@ -20,7 +22,15 @@ pkcs11::Operation operation;
 CK_FUNCTION_LIST_PTR ckpFunctions = nullptr;
 CK_RV rv = 0;
 
+char* (*gModuleNameCopy)(const char*) = strdup;
+
 namespace {
+
+// mModuleName is set from Java threads (connect) while the server thread
+// reads it: every write, and the server thread's copy of it, hold this lock.
+std::mutex moduleNameLock;
+// The last name could not be copied: no module serves until the next one.
+bool moduleNameLost = false;
 
 using Handler = std::string (*)(const std::string&);
 
@@ -101,14 +111,30 @@ const Command kCommands[] = {
     {"C_WaitForSlotEvent", C_WaitForSlotEvent_Server},
 };
 
+// The registry name to serve from: set (the current name or NULL) or lost.
+struct ServedName {
+    bool lost;
+    bool set;
+    std::string name;
+};
+
+ServedName servedName() {
+    std::lock_guard<std::mutex> lock(moduleNameLock);
+    if (moduleNameLost) return {true, false, std::string()};
+    if (mModuleName == nullptr) return {false, false, std::string()};
+    return {false, true, std::string(mModuleName)};
+}
+
 // No command name ever matches "C_GetFunctionList": the client serves it.
 std::string dispatch(const std::string& request) {
     operation.ParseFromString(request);  // a malformed request simply matches nothing
     const std::string name = operation.name().c_str();
     // Departs from a bare lookup: the module stays loaded until the handler
     // returns, even if disconnect takes it out of the registry meanwhile.
-    ModuleHold module(mModuleName);
-    ckpFunctions = module.functions();
+    const ServedName served = servedName();
+    std::optional<ModuleHold> module;
+    if (!served.lost) module.emplace(served.set ? served.name.c_str() : nullptr);
+    ckpFunctions = module ? module->functions() : nullptr;
     std::string answer;
     for (const Command& command : kCommands) {
         if (name != command.name) continue;
@@ -136,14 +162,19 @@ int32_t vokpkcs11_server_getLastUsageTime(void) {
 }
 
 int32_t setModuleName_Server(const char* name) {
+    std::lock_guard<std::mutex> lock(moduleNameLock);
     if (name == nullptr) {
         // The previous copy is dropped without being freed; long-standing
         // behaviour, kept.
         mModuleName = nullptr;
+        moduleNameLost = false;
         return 0;
     }
     std::free(mModuleName);
-    mModuleName = strdup(name);
+    mModuleName = gModuleNameCopy(name);
+    // A copy that failed leaves no module to serve, where it used to leave
+    // NULL, which serves the first module registered.
+    moduleNameLost = mModuleName == nullptr;
     return 0;
 }
 

@@ -3,6 +3,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <atomic>
 #include <cstddef>
 #include <cstdint>
 #include <cstdlib>
@@ -12,6 +13,7 @@
 #include <ostream>
 #include <random>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "jvm_fixture.h"
@@ -391,4 +393,27 @@ TEST_F(Dispatcher, AFunctionTheListLeavesNullIsNotSupported) {
         EXPECT_EQ(CKR_FUNCTION_NOT_SUPPORTED, res.result());
         EXPECT_EQ(0u, fake_vendor_call_count());
     }
+}
+
+// Under the address sanitizer a reader of a freed name is reported.
+TEST_F(Dispatcher, ANameReplacedWhileCommandsAreServedIsNeverReadFreed) {
+    voktest::registerModule("vok-other-name", fake_vendor_function_list());
+    std::atomic<bool> done{false};
+    std::thread renamer([&] {
+        for (int i = 0; !done; ++i) setModuleName_Server(i % 2 ? kModuleName : "vok-other-name");
+    });
+    for (int i = 0; i < 2000; ++i)
+        EXPECT_EQ("C_GetInfo", parsed(dispatch(requestBytes("C_GetInfo"))).name());
+    done = true;
+    renamer.join();
+}
+
+TEST_F(Dispatcher, ANameThatCouldNotBeCopiedServesNoModule) {
+    gModuleNameCopy = [](const char*) -> char* { return nullptr; };
+    setModuleName_Server("vok-next-name");
+    gModuleNameCopy = strdup;
+    EXPECT_EQ("", dispatch(requestBytes("C_GetInfo")));
+    EXPECT_EQ(0u, fake_vendor_call_count());
+    setModuleName_Server(kModuleName);
+    EXPECT_EQ("C_GetInfo", parsed(dispatch(requestBytes("C_GetInfo"))).name());
 }
