@@ -6,6 +6,7 @@
 #include <sys/time.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <atomic>
 #include <cerrno>
 #include <cstdint>
@@ -34,7 +35,45 @@ std::atomic<CommandCallback> commandCallback{nullptr};
 std::atomic<int32_t> lastRequestTime{0};
 std::atomic<int32_t> lastResponseTime{0};
 
-using MallocBuffer = std::unique_ptr<void, decltype(&std::free)>;
+// The first piece of a payload taken before its bytes arrive; it doubles as
+// they do, so a header alone never makes the service allocate what it claims.
+constexpr size_t kFirstPayloadPiece = 64 * 1024;
+
+void (*const volatile wipeWith)(void*, int, size_t) = [](void* p, int c, size_t n) {
+    std::memset(p, c, n);
+};
+
+// A received payload: grown as its bytes arrive, wiped before it is released
+// (requests carry PINs).
+class Payload {
+public:
+    Payload() = default;
+    ~Payload() { release(); }
+    Payload(const Payload&) = delete;
+    Payload& operator=(const Payload&) = delete;
+
+    uint8_t* data() const { return data_; }
+    size_t capacity() const { return capacity_; }
+    bool grow(size_t capacity) {
+        auto* grown = static_cast<uint8_t*>(std::malloc(capacity));
+        if (grown == nullptr) return false;
+        if (data_ != nullptr) std::memcpy(grown, data_, capacity_);
+        release();
+        data_ = grown;
+        capacity_ = capacity;
+        return true;
+    }
+    void release() {
+        if (data_ != nullptr) wipeWith(data_, 0, capacity_);
+        std::free(data_);
+        data_ = nullptr;
+        capacity_ = 0;
+    }
+
+private:
+    uint8_t* data_ = nullptr;
+    size_t capacity_ = 0;
+};
 
 // Seconds plus the milliseconds of the current second: the mixed unit is what
 // the usage statistics have always reported.
@@ -173,6 +212,29 @@ int32_t sendResponse(int fd, FrameHeader header, void* response, uint32_t respon
     return exitWith(status);
 }
 
+// Takes memory for the payload only as its bytes arrive: a departure from
+// allocating the whole length a header claims before any of it is there.
+int32_t receivePayload(int fd, int32_t length, Payload& payload) {
+    const size_t total = length < 0 ? 0 : static_cast<size_t>(length);
+    if (length < 0 || !payload.grow(std::min(total, kFirstPayloadPiece))) {
+        VOK_LOGD("Malloc failed");
+        return CHANNEL_OUT_OF_MEMORY;
+    }
+    for (size_t received = 0; received < total; received = payload.capacity()) {
+        if (received == payload.capacity() && !payload.grow(std::min(total, 2 * received))) {
+            VOK_LOGD("Malloc failed");
+            return CHANNEL_OUT_OF_MEMORY;
+        }
+        const int32_t status = server_recv_data(
+            fd, payload.data() + received, static_cast<int32_t>(payload.capacity() - received));
+        if (status != CHANNEL_OK) {
+            VOK_LOGD("Receive command data failed");
+            return status;
+        }
+    }
+    return CHANNEL_OK;
+}
+
 int32_t processClientCommand(int fd) {
     VOK_LOGD("\n\n================");
     VOK_LOGD("Entry");
@@ -196,20 +258,11 @@ int32_t processClientCommand(int fd) {
     // The peer decides the size; a negative one fails here like an allocation
     // failure, without being handed to malloc. The unread payload is then
     // taken for the next header.
-    MallocBuffer payload(
-        header.data_len < 0 ? nullptr : std::malloc(static_cast<size_t>(header.data_len)),
-        &std::free);
-    if (!payload) {
-        VOK_LOGD("Malloc failed");
-        return CHANNEL_OUT_OF_MEMORY;
-    }
-    status = server_recv_data(fd, payload.get(), header.data_len);
-    if (status != CHANNEL_OK) {
-        VOK_LOGD("Receive command data failed");
-        return status;
-    }
-    status = processCommand(header.id, payload.get(), header.data_len, &response, &responseLength);
-    payload.reset();
+    Payload payload;
+    status = receivePayload(fd, header.data_len, payload);
+    if (status != CHANNEL_OK) return status;
+    status = processCommand(header.id, payload.data(), header.data_len, &response, &responseLength);
+    payload.release();
     if (status != CHANNEL_OK) {
         VOK_LOGD("process command returned :%d", status);
         return status;

@@ -8,8 +8,13 @@
 #include <optional>
 #include <string>
 
+#ifdef __GLIBC__
+#include <malloc.h>
+#endif
+
 #include "handler_frame.h"
 #include "marshal.h"
+#include "request_memory.h"
 #include "vok_comm.h"
 #include "vok_registry.h"
 #include "vok_server.h"
@@ -31,6 +36,10 @@ namespace {
 std::mutex moduleNameLock;
 // The last name could not be copied: no module serves until the next one.
 bool moduleNameLost = false;
+
+// A request that made the service take this much is followed by giving the
+// freed memory back to the system.
+constexpr size_t kTrimAfter = size_t{4} << 20;
 
 using Handler = std::string (*)(const std::string&);
 
@@ -127,8 +136,18 @@ ServedName servedName() {
 
 // No command name ever matches "C_GetFunctionList": the client serves it.
 std::string dispatch(const std::string& request) {
+    // A request whose parse alone would cost the service more than its
+    // allowance is answered like one nobody serves (a departure: the parse
+    // used to take whatever the request's structure asked for).
+    if (!vok::server::parseAffordable(request)) {
+        VOK_LOGE("Request of %d bytes not served: beyond its memory allowance",
+                 static_cast<int>(request.size()));
+        return std::string();
+    }
     operation.ParseFromString(request);  // a malformed request simply matches nothing
     const std::string name = operation.name().c_str();
+    vok::server::releaseRequest();  // the handler parses the request again
+
     // Departs from a bare lookup: the module stays loaded until the handler
     // returns, even if disconnect takes it out of the registry meanwhile.
     const ServedName served = servedName();
@@ -182,8 +201,8 @@ int32_t Generate_Operation_Result_Server(const void* request, int32_t requestLen
                                          void** response, uint32_t* responseLength) {
     if (response == nullptr || responseLength == nullptr) return 0;
     std::string result;
+    std::string bytes;
     try {
-        std::string bytes;
         if (request != nullptr && requestLength > 0)
             bytes.assign(static_cast<const char*>(request), static_cast<size_t>(requestLength));
         result = dispatch(bytes);
@@ -191,6 +210,12 @@ int32_t Generate_Operation_Result_Server(const void* request, int32_t requestLen
         // Out of memory before a handler ran: answered like an unknown command.
         result.clear();
     }
+    // Nothing of the request outlives its answer, and its PINs are wiped first.
+    vok::server::releaseRequest();
+    vok::server::wipe(bytes);
+#ifdef __GLIBC__
+    if (bytes.size() + result.size() >= kTrimAfter) malloc_trim(0);
+#endif
     if (result.size() > vok::server::kFrameLimit) result.clear();
     // A failed allocation also leaves the empty answer.
     uint8_t* buffer = new (std::nothrow) uint8_t[result.size()];

@@ -8,6 +8,7 @@
 #include <string>
 
 #include "marshal.h"
+#include "request_memory.h"
 #include "vok_server.h"
 
 namespace vok {
@@ -32,23 +33,29 @@ Function offered(Function function) {
 // `operation`, stores the module's return value in `rv` and fills the answer's
 // sub-message whatever `rv` is. A Refusal it throws is answered with its code;
 // whatever else it throws (in practice sizes from the request that cannot be
-// allocated) ends in the empty answer, the one the client also gets for a
-// command nobody serves.
+// allocated, or beyond the request's buffer allowance) ends in the empty
+// answer, the one the client also gets for a command nobody serves. The
+// parsed request is wiped and released before the answer leaves.
 template <class Body>
 std::string serve(const std::string& request, const char* responseName, Body&& body) noexcept {
+    std::string answer;
     try {
+        BufferBudget budget(request.size());
         operation.ParseFromString(request);
-        if (ckpFunctions == nullptr) return std::string();
-        pkcs11::OperationResult response;
-        response.set_name(responseName);
-        body(response);
-        response.set_result(rv);
-        return serialised(response);
+        if (ckpFunctions != nullptr) {
+            pkcs11::OperationResult response;
+            response.set_name(responseName);
+            body(response);
+            response.set_result(rv);
+            answer = serialised(response);
+        }
     } catch (const Refusal& refusal) {
-        return refused(responseName, refusal.rv);
+        answer = refused(responseName, refusal.rv);
     } catch (...) {
-        return std::string();
+        answer.clear();
     }
+    releaseRequest();
+    return answer;
 }
 
 }  // namespace server

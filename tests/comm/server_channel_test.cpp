@@ -521,5 +521,17 @@ TEST_F(ServerChannelTest, SettingTheChannelUpAgainNeverMixesUpExchangesInFlight)
     EXPECT_GT(answered.load(), 0);
 }
 
+// A header alone never makes the service take the memory it announces.
+TEST_F(ServerChannelTest, APayloadIsAllocatedOnlyAsItArrives) {
+    RawSocket& client = start();
+    const uint64_t before = addressSpaceInUse();
+    ASSERT_TRUE(client.sendHeader(commandHeader(INT32_MAX)));
+    ASSERT_TRUE(client.sendBytes(Bytes(1000, 7)));
+    ASSERT_TRUE(waitForLine("Bytes read:1000"));
+    EXPECT_LT(addressSpaceInUse(), before + (64u << 20));
+    client.close();
+    EXPECT_TRUE(waitForLine("Receive command data failed"));
+}
+
 }  // namespace
 }  // namespace voktest

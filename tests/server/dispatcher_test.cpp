@@ -2,12 +2,14 @@
 // Java VM), and what it makes of requests no proxy would send.
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <malloc.h>
 
 #include <atomic>
 #include <cstddef>
 #include <cstdint>
 #include <cstdlib>
 #include <cstring>
+#include <fstream>
 #include <map>
 #include <memory>
 #include <ostream>
@@ -15,6 +17,10 @@
 #include <string>
 #include <thread>
 #include <vector>
+
+#if defined(__SANITIZE_ADDRESS__)
+#include <sanitizer/allocator_interface.h>
+#endif
 
 #include "jvm_fixture.h"
 #include "log_capture.h"
@@ -211,6 +217,7 @@ TEST_F(Dispatcher, ACommandSeesNothingOfThePreviousOne) {
 constexpr uint64_t kHuge = uint64_t{1} << 62;
 constexpr uint64_t kAll = ~uint64_t{0};
 constexpr uint64_t kOverHalfAFrame = (uint64_t{3} << 29);  // 1.5 GiB, each fits, both do not
+constexpr uint64_t kBeyondAllowance = (uint64_t{16} << 20) + 4096;
 
 struct Oversized {
     const char* label;
@@ -292,6 +299,25 @@ const Oversized kOversized[] = {
     {"RandomLength", "C_GenerateRandom",
      [](auto& op) { op.mutable_generaterandom()->set_ulrandomlen(kHuge); }},
     {"SeedLength", "C_SeedRandom", [](auto& op) { op.mutable_seedrandom()->set_ulseedlen(kAll); }},
+    // Each within a frame, but beyond what a request this small may make the
+    // service allocate.
+    {"RandomWithinAFrame", "C_GenerateRandom",
+     [](auto& op) {
+         op.mutable_generaterandom()->set_randomdata("");
+         op.mutable_generaterandom()->set_ulrandomlen(INT32_MAX);
+     }},
+    {"CapacityBeyondTheAllowance", "C_Decrypt",
+     [](auto& op) {
+         op.mutable_dec()->set_pdata("");
+         op.mutable_dec()->set_puldatalen(kBeyondAllowance);
+     }},
+    {"HandlesBeyondTheAllowance", "C_FindObjects",
+     [](auto& op) { op.mutable_findobj()->set_ulmaxobjectcount(kBeyondAllowance / 8); }},
+    {"ValueBeyondTheAllowance", "C_GetAttributeValue",
+     [](auto& op) {
+         value(op.mutable_attvalue()->add_attribute(), kBeyondAllowance);
+         op.mutable_attvalue()->set_ulcount(1);
+     }},
 };
 
 void PrintTo(const Oversized& o, std::ostream* os) { *os << o.label; }
@@ -416,4 +442,58 @@ TEST_F(Dispatcher, ANameThatCouldNotBeCopiedServesNoModule) {
     EXPECT_EQ(0u, fake_vendor_call_count());
     setModuleName_Server(kModuleName);
     EXPECT_EQ("C_GetInfo", parsed(dispatch(requestBytes("C_GetInfo"))).name());
+}
+
+size_t allocatedBytes() {
+#if defined(__SANITIZE_ADDRESS__)
+    return __sanitizer_get_current_allocated_bytes();
+#else
+    return mallinfo2().uordblks + mallinfo2().hblkhd;
+#endif
+}
+
+// The process's peak resident memory since the last reset, in bytes.
+size_t peakResident(bool reset = false) {
+    if (reset) std::ofstream("/proc/self/clear_refs") << "5";
+    std::ifstream status("/proc/self/status");
+    for (std::string line; std::getline(status, line);)
+        if (line.rfind("VmHWM:", 0) == 0) return std::stoul(line.substr(6)) * 1024;
+    return 0;
+}
+
+// A C_CreateObject request with `count` empty template entries, written by
+// hand: building it as messages would take the memory the test watches.
+std::string emptyAttributes(size_t count) {
+    const std::string entries = [&] {
+        std::string bytes;
+        for (size_t i = 0; i < count; ++i) bytes.append("\x12\x00", 2);  // pTemplate, empty
+        return bytes;
+    }();
+    std::string request = requestBytes(
+        "C_CreateObject", [&](auto& op) { op.mutable_createobject()->set_ulcount(count); });
+    // A second occurrence of the sub-message (field 36) is merged into the first.
+    request += "\xa2\x02";
+    uint64_t length = entries.size();
+    for (; length >= 0x80; length >>= 7) request += static_cast<char>(length | 0x80);
+    request += static_cast<char>(length);
+    return request + entries;
+}
+
+TEST_F(Dispatcher, NothingOfARequestStaysAllocatedAfterItsAnswer) {
+    const std::string request = emptyAttributes(10000);
+    dispatch(requestBytes("C_GetInfo"));
+    fake_vendor_reset();  // what the module keeps (records, objects) is not the service's
+    const size_t before = allocatedBytes();
+    EXPECT_EQ("C_CreateObject", parsed(dispatch(request)).name());
+    fake_vendor_reset();
+    EXPECT_LT(allocatedBytes(), before + 16 * 1024);
+}
+
+// The documented bound: about 16 times the request's size plus 70 MiB.
+TEST_F(Dispatcher, ARequestBuiltToBloatItsParseIsRefusedWithinTheBound) {
+    const std::string request = emptyAttributes(4 << 20);
+    const size_t start = peakResident(true);
+    EXPECT_EQ("", dispatch(request));
+    EXPECT_EQ(0u, fake_vendor_call_count());
+    EXPECT_LT(peakResident() - start, 16 * request.size() + (70u << 20));
 }
