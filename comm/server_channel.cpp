@@ -3,6 +3,7 @@
 // command to the registered callback.
 
 #include <signal.h>
+#include <sys/socket.h>
 #include <sys/time.h>
 #include <unistd.h>
 
@@ -14,7 +15,9 @@
 #include <cstdlib>
 #include <cstring>
 #include <memory>
+#include <mutex>
 #include <new>
+#include <vector>
 
 #define LOG_TAG "VOKPKCS11-COMM_SERVER"
 #include "comm_internal.h"
@@ -38,6 +41,12 @@ std::atomic<int32_t> lastResponseTime{0};
 // The first piece of a payload taken before its bytes arrive; it doubles as
 // they do, so a header alone never makes the service allocate what it claims.
 constexpr size_t kFirstPayloadPiece = 64 * 1024;
+
+// Peers that may connect, by user id; not set, anyone may. Set from Java
+// threads, read by the server thread after each accept.
+std::mutex allowedPeersLock;
+bool allowedPeersSet = false;
+std::vector<uid_t> allowedPeers;
 
 void (*const volatile wipeWith)(void*, int, size_t) = [](void* p, int c, size_t n) {
     std::memset(p, c, n);
@@ -293,6 +302,23 @@ int acceptClient(int fd) {
     }
 }
 
+// The abstract socket has no file permissions: with an allow list set, a
+// peer whose user id is not on it is closed before anything is read.
+bool peerAllowed(int fd) {
+    std::lock_guard<std::mutex> lock(allowedPeersLock);
+    if (!allowedPeersSet) return true;
+    ucred peer{};
+    socklen_t length = sizeof(peer);
+    if (getsockopt(fd, SOL_SOCKET, SO_PEERCRED, &peer, &length) != 0) {
+        VOK_LOGE("Client credentials unavailable - connection closed");
+        return false;
+    }
+    if (std::find(allowedPeers.begin(), allowedPeers.end(), peer.uid) != allowedPeers.end())
+        return true;
+    VOK_LOGE("Client uid %u not allowed - connection closed", static_cast<unsigned>(peer.uid));
+    return false;
+}
+
 int32_t failSetUp(const char* line, int32_t status) {
     VOK_LOGD("%s", line);
     close(listenFd);
@@ -322,6 +348,10 @@ int32_t runServer(const char* serverId) {
     VOK_LOGD("Wait for new client %s", serverId);
     for (;;) {
         int client = acceptClient(listenFd);
+        if (!peerAllowed(client)) {
+            close(client);
+            continue;
+        }
         VOK_LOGD("Client connected - socket id:%d", client);
         serveClient(client);
         VOK_LOGD("Socket error. Wait for new client");
@@ -418,6 +448,17 @@ VOK_C_API int32_t vokpkcs11_comm_server_getLastUsageTime(void) {
     const int32_t request = lastRequestTime;
     const int32_t response = lastResponseTime;
     return request > response ? -1 : response;
+}
+
+ChannelStatus vokpkcs11_comm_server_setAllowedPeers(const uint32_t* uids, int32_t count) {
+    return vokcomm::noThrow(CHANNEL_OUT_OF_MEMORY, [&] {
+        std::vector<uid_t> list;
+        if (uids != nullptr && count > 0) list.assign(uids, uids + count);
+        std::lock_guard<std::mutex> lock(allowedPeersLock);
+        allowedPeersSet = uids != nullptr && count >= 0;
+        allowedPeers.swap(list);
+        return CHANNEL_OK;
+    });
 }
 
 pthread_t vokcomm::serverThread() { return serverThreadHandle; }
