@@ -3,6 +3,8 @@
 // in this process holds it.
 #include <dlfcn.h>
 #include <gtest/gtest.h>
+#include <sys/socket.h>
+#include <sys/time.h>
 
 #include <string>
 
@@ -46,6 +48,9 @@ TEST_F(DisconnectRace, TheModuleStaysLoadedUntilTheCallInsideItReturns) {
     block(CK_TRUE);
 
     voktest::RawSocket client = voktest::rawConnect(id);
+    // A server thread that died inside the unloaded module never answers.
+    timeval limit{10, 0};
+    setsockopt(client.fd(), SOL_SOCKET, SO_RCVTIMEO, &limit, sizeof(limit));
     voktest::WireHeader header;
     voktest::Bytes payload;
     ASSERT_TRUE(client.sendFrame({100, 103, 0, 4}, voktest::int32Bytes(1)));
