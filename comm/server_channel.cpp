@@ -3,9 +3,11 @@
 // command to the registered callback.
 
 #include <signal.h>
+#include <sys/socket.h>
 #include <sys/time.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <atomic>
 #include <cerrno>
 #include <cstdint>
@@ -13,7 +15,9 @@
 #include <cstdlib>
 #include <cstring>
 #include <memory>
+#include <mutex>
 #include <new>
+#include <vector>
 
 #define LOG_TAG "VOKPKCS11-COMM_SERVER"
 #include "comm_internal.h"
@@ -36,7 +40,51 @@ std::atomic<CommandCallback> commandCallback{nullptr};
 std::atomic<int32_t> lastRequestTime{0};
 std::atomic<int32_t> lastResponseTime{0};
 
-using MallocBuffer = std::unique_ptr<void, decltype(&std::free)>;
+// The first piece of a payload taken before its bytes arrive; it doubles as
+// they do, so a header alone never makes the service allocate what it claims.
+constexpr size_t kFirstPayloadPiece = 64 * 1024;
+
+// Peers that may connect, by user id; not set, anyone may. Set from Java
+// threads, read by the server thread after each accept.
+std::mutex allowedPeersLock;
+bool allowedPeersSet = false;
+std::vector<uid_t> allowedPeers;
+
+void (*const volatile wipeWith)(void*, int, size_t) = [](void* p, int c, size_t n) {
+    std::memset(p, c, n);
+};
+
+// A received payload: grown as its bytes arrive, wiped before it is released
+// (requests carry PINs).
+class Payload {
+public:
+    Payload() = default;
+    ~Payload() { release(); }
+    Payload(const Payload&) = delete;
+    Payload& operator=(const Payload&) = delete;
+
+    uint8_t* data() const { return data_; }
+    size_t capacity() const { return capacity_; }
+    bool grow(size_t capacity) {
+        auto* grown = static_cast<uint8_t*>(std::malloc(capacity));
+        if (grown == nullptr) return false;
+        if (data_ != nullptr) std::memcpy(grown, data_, capacity_);
+        release();
+        data_ = grown;
+        capacity_ = capacity;
+        return true;
+    }
+    void release() {
+        if (data_ != nullptr) wipeWith(data_, 0, capacity_);
+        std::free(data_);
+        data_ = nullptr;
+        capacity_ = 0;
+    }
+
+private:
+    uint8_t* data_ = nullptr;
+    size_t capacity_ = 0;
+};
 
 // Seconds plus the milliseconds of the current second: the mixed unit is what
 // the usage statistics have always reported.
@@ -213,6 +261,29 @@ int32_t sendResponse(int fd, FrameHeader header, void* response, uint32_t respon
     return exitWith(status);
 }
 
+// Takes memory for the payload only as its bytes arrive: a departure from
+// allocating the whole length a header claims before any of it is there.
+int32_t receivePayload(int fd, vokcomm::ReceiveStage& stage, int32_t length, Payload& payload) {
+    const size_t total = length < 0 ? 0 : static_cast<size_t>(length);
+    if (length < 0 || !payload.grow(std::min(total, kFirstPayloadPiece))) {
+        VOK_LOGD("Malloc failed");
+        return CHANNEL_OUT_OF_MEMORY;
+    }
+    for (size_t received = 0; received < total; received = payload.capacity()) {
+        if (received == payload.capacity() && !payload.grow(std::min(total, 2 * received))) {
+            VOK_LOGD("Malloc failed");
+            return CHANNEL_OUT_OF_MEMORY;
+        }
+        const int32_t status = receive(fd, stage, payload.data() + received,
+                                       static_cast<int32_t>(payload.capacity() - received));
+        if (status != CHANNEL_OK) {
+            VOK_LOGD("Receive command data failed");
+            return status;
+        }
+    }
+    return CHANNEL_OK;
+}
+
 int32_t processClientCommand(int fd, vokcomm::ReceiveStage& stage) {
     VOK_LOGD("\n\n================");
     VOK_LOGD("Entry");
@@ -236,20 +307,11 @@ int32_t processClientCommand(int fd, vokcomm::ReceiveStage& stage) {
     // The peer decides the size; a negative one fails here like an allocation
     // failure, without being handed to malloc. The unread payload is then
     // taken for the next header.
-    MallocBuffer payload(
-        header.data_len < 0 ? nullptr : std::malloc(static_cast<size_t>(header.data_len)),
-        &std::free);
-    if (!payload) {
-        VOK_LOGD("Malloc failed");
-        return CHANNEL_OUT_OF_MEMORY;
-    }
-    status = receive(fd, stage, payload.get(), header.data_len);
-    if (status != CHANNEL_OK) {
-        VOK_LOGD("Receive command data failed");
-        return status;
-    }
-    status = processCommand(header.id, payload.get(), header.data_len, &response, &responseLength);
-    payload.reset();
+    Payload payload;
+    status = receivePayload(fd, stage, header.data_len, payload);
+    if (status != CHANNEL_OK) return status;
+    status = processCommand(header.id, payload.data(), header.data_len, &response, &responseLength);
+    payload.release();
     if (status != CHANNEL_OK) {
         VOK_LOGD("process command returned :%d", status);
         return status;
@@ -281,6 +343,23 @@ int acceptClient(int fd) {
     }
 }
 
+// The abstract socket has no file permissions: with an allow list set, a
+// peer whose user id is not on it is closed before anything is read.
+bool peerAllowed(int fd) {
+    std::lock_guard<std::mutex> lock(allowedPeersLock);
+    if (!allowedPeersSet) return true;
+    ucred peer{};
+    socklen_t length = sizeof(peer);
+    if (getsockopt(fd, SOL_SOCKET, SO_PEERCRED, &peer, &length) != 0) {
+        VOK_LOGE("Client credentials unavailable - connection closed");
+        return false;
+    }
+    if (std::find(allowedPeers.begin(), allowedPeers.end(), peer.uid) != allowedPeers.end())
+        return true;
+    VOK_LOGE("Client uid %u not allowed - connection closed", static_cast<unsigned>(peer.uid));
+    return false;
+}
+
 int32_t failSetUp(const char* line, int32_t status) {
     VOK_LOGD("%s", line);
     close(listenFd);
@@ -310,6 +389,10 @@ int32_t runServer(const char* serverId) {
     VOK_LOGD("Wait for new client %s", serverId);
     for (;;) {
         int client = acceptClient(listenFd);
+        if (!peerAllowed(client)) {
+            close(client);
+            continue;
+        }
         VOK_LOGD("Client connected - socket id:%d", client);
         serveClient(client);
         VOK_LOGD("Socket error. Wait for new client");
@@ -393,6 +476,17 @@ VOK_C_API int32_t vokpkcs11_comm_server_getLastUsageTime(void) {
     const int32_t request = lastRequestTime;
     const int32_t response = lastResponseTime;
     return request > response ? -1 : response;
+}
+
+ChannelStatus vokpkcs11_comm_server_setAllowedPeers(const uint32_t* uids, int32_t count) {
+    return vokcomm::noThrow(CHANNEL_OUT_OF_MEMORY, [&] {
+        std::vector<uid_t> list;
+        if (uids != nullptr && count > 0) list.assign(uids, uids + count);
+        std::lock_guard<std::mutex> lock(allowedPeersLock);
+        allowedPeersSet = uids != nullptr && count >= 0;
+        allowedPeers.swap(list);
+        return CHANNEL_OK;
+    });
 }
 
 pthread_t vokcomm::serverThread() { return serverThreadHandle; }

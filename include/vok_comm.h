@@ -90,4 +90,9 @@ VOK_C_API ChannelStatus vokpkcs11_comm_server_init(const char* serverId, Command
 VOK_C_API ChannelStatus vokpkcs11_comm_server_deinit(void);
 VOK_C_API int32_t vokpkcs11_comm_server_getLastUsageTime(void);
 
+/* Internal: from now on only peers whose user id is one of the `count` in
+ * `uids` are served (none for an empty list); NULL lets everyone connect, as
+ * before any call. Refused peers are closed right after accept. */
+ChannelStatus vokpkcs11_comm_server_setAllowedPeers(const uint32_t* uids, int32_t count);
+
 #endif

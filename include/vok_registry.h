@@ -28,4 +28,27 @@ VOK_C_API CK_FUNCTION_LIST_PTR getFunctionsByModule(const char* name);
 // VM refuses. Not exported.
 VOK_EXTERN_C int keepThreadAttachedToJavaVm(void);
 
+#ifdef __cplusplus
+// Internal to the library. A call into a module holds its entry: disconnect
+// may take the entry out of the registry meanwhile, but the module is unloaded
+// only once the last call that holds it has returned.
+class ModuleHold {
+public:
+    // getFunctionsByModule(name), with the entry held while this object lives.
+    explicit ModuleHold(const char* name);
+    ~ModuleHold();
+    ModuleHold(const ModuleHold&) = delete;
+    ModuleHold& operator=(const ModuleHold&) = delete;
+    CK_FUNCTION_LIST_PTR functions() const { return functions_; }
+
+private:
+    ModuleEntry* entry_;
+    CK_FUNCTION_LIST_PTR functions_;
+};
+
+// Closes the library of an entry taken out of the registry and frees the
+// entry: at once when no call holds it, otherwise when the last one returns.
+void unloadModuleEntry(ModuleEntry* entry);
+#endif
+
 #endif

@@ -27,6 +27,10 @@ VOK_EXPORT extern CK_FUNCTION_LIST_PTR ckpFunctions;
 VOK_EXPORT extern CK_RV rv;
 }
 
+// How setModuleName_Server copies the name (strdup); tests swap it to reach
+// the failure path. Not exported.
+extern char* (*gModuleNameCopy)(const char*);
+
 // Names the module and starts the server thread; returns the channel's status.
 VOK_C_API int32_t vokpkcs11_init_server(const char* serverId);
 // Stops nothing: the server thread serves until the process ends.

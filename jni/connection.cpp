@@ -9,10 +9,12 @@
 #include <cstdlib>
 #include <cstring>
 #include <string>
+#include <vector>
 
 #include "exceptions.h"
 #include "registry.h"
 #include "vok_client.h"
+#include "vok_comm.h"
 #include "vok_export.h"
 #include "vok_log.h"
 #include "vok_pkcs11.h"
@@ -24,6 +26,9 @@ VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_connect(JNIEnv* env,
                                                                     jstring serverId,
                                                                     jint isServer);
 VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_disconnect(JNIEnv* env, jobject thiz);
+VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_setAllowedPeerUids(JNIEnv* env,
+                                                                               jclass clazz,
+                                                                               jintArray uids);
 VOK_C_API jlong JNICALL
 Java_com_vok_smartcard_adapter_SandboxedProcessUsageStatistics_native_1getLastUsageTime(
     JNIEnv* env, jclass clazz);
@@ -212,14 +217,29 @@ void connect(JNIEnv* env, jobject thiz, jstring libraryNameString, jstring funct
 
 void disconnect(JNIEnv* env, jobject thiz) {
     VOK_LOGD("DEBUG: disconnecting module...");
-    ModuleEntry* entry = removeModuleEntry(env, thiz);
-    if (entry != nullptr && entry->libraryHandle != nullptr) dlclose(entry->libraryHandle);
-    std::free(entry);
+    // Closed once no call into the module is running any more.
+    unloadModuleEntry(removeModuleEntry(env, thiz));
     // Whatever role this process took: each deinit does nothing when its end
     // is not open.
     vokpkcs11_client_deinit();
     vokpkcs11_server_deinit();
     VOK_LOGD("FINISHED\n");
+}
+
+void setAllowedPeerUids(JNIEnv* env, jintArray uids) {
+    if (uids == nullptr) {
+        vokpkcs11_comm_server_setAllowedPeers(nullptr, 0);
+        return;
+    }
+    // Java ints carry the ids' 32 bits unchanged.
+    std::vector<uint32_t> list(static_cast<size_t>(env->GetArrayLength(uids)));
+    env->GetIntArrayRegion(uids, 0, static_cast<jsize>(list.size()),
+                           reinterpret_cast<jint*>(list.data()));
+    // An empty list serves nobody: it must not reach the channel as NULL.
+    static const uint32_t kNone = 0;
+    if (vokpkcs11_comm_server_setAllowedPeers(list.empty() ? &kNone : list.data(),
+                                              static_cast<int32_t>(list.size())) != 0)
+        throwOutOfMemoryError(env);
 }
 
 // Only allocation can throw in here (the error texts); it reaches Java as
@@ -244,6 +264,15 @@ void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_connect(JNIEnv* env, jobject t
 void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_disconnect(JNIEnv* env, jobject thiz) {
     try {
         disconnect(env, thiz);
+    } catch (...) {
+        throwOutOfMemoryIfNothingPending(env);
+    }
+}
+
+void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_setAllowedPeerUids(JNIEnv* env, jclass,
+                                                                     jintArray uids) {
+    try {
+        setAllowedPeerUids(env, uids);
     } catch (...) {
         throwOutOfMemoryIfNothingPending(env);
     }

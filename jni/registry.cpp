@@ -5,6 +5,7 @@
 #include <cstring>
 
 #include "exceptions.h"
+#include "module_holds.h"
 #include "vok_log.h"
 
 JavaVM* gJavaVM = nullptr;
@@ -96,9 +97,6 @@ public:
     ListMonitor& operator=(const ListMonitor&) = delete;
 
     bool held() const { return held_; }
-    // The node-allocation failure returns with the monitor still entered;
-    // that asymmetry is long-standing behaviour, kept on purpose.
-    void leaveEntered() { held_ = false; }
 
 private:
     JNIEnv* env_;
@@ -143,20 +141,55 @@ ThreadEnv envForCurrentThread() {
     return {static_cast<JNIEnv*>(attached), true};
 }
 
-ModuleEntry* findByName(JNIEnv* env, const char* name) {
+// With `hold`, the entry found is held before the monitor is released.
+ModuleEntry* findByName(JNIEnv* env, const char* name, bool hold) {
     ListMonitor monitor(env);
     if (!monitor.held() || moduleListHead == nullptr) return nullptr;
+    ModuleEntry* entry = nullptr;
     if (name == nullptr) {
         VOK_LOGD("found default entry");
-        return moduleListHead->entry;
-    }
-    Walk walk = walkByName(name);
-    if (walk.match == Match::Yes) {
+        entry = moduleListHead->entry;
+    } else {
+        Walk walk = walkByName(name);
+        if (walk.match != Match::Yes) {
+            VOK_LOGD("the entry is not in the list");
+            return nullptr;
+        }
         VOK_LOGD("found the entry");
-        return walk.node->entry;
+        entry = walk.node->entry;
     }
-    VOK_LOGD("the entry is not in the list");
-    return nullptr;
+    return !hold || holdModuleEntry(entry) ? entry : nullptr;
+}
+
+ModuleEntry* lookUpByName(const char* name, bool hold) {
+    if (name != nullptr)
+        VOK_LOGD("module name passed %s", name);
+    else
+        VOK_LOGD("module name passed NULL");
+
+    ThreadEnv thread = envForCurrentThread();
+    if (thread.env == nullptr) return nullptr;
+    // A thread attached above stays attached on this return; long-standing
+    // behaviour, kept.
+    if (moduleListLock == nullptr) return nullptr;
+
+    ModuleEntry* entry = findByName(thread.env, name, hold);
+    if (thread.attached) gJavaVM->DetachCurrentThread();
+    return entry;
+}
+
+CK_FUNCTION_LIST_PTR functionsOf(ModuleEntry* entry) {
+    if (entry == nullptr) {
+        // Logged twice: long-standing output, kept.
+        VOK_LOGD("failed getting module entry");
+        VOK_LOGD("failed getting module entry");
+        return nullptr;
+    }
+    if (entry->functionList == nullptr) {
+        VOK_LOGD("ckpFunctions is null %s", "getFunctionsByModule");
+        return nullptr;
+    }
+    return entry->functionList;
 }
 
 }  // namespace
@@ -221,8 +254,9 @@ void putModuleEntry(JNIEnv* env, jobject key, ModuleEntry* entry) {
     }
     ModuleListNode* node = newNode(key, entry);
     if (node == nullptr) {
+        // Departs from the old failure path, which kept the monitor entered and
+        // so hung the server thread's next lookup: the monitor is released.
         throwOutOfMemoryError(env);
-        monitor.leaveEntered();
         return;
     }
     if (walk.node == nullptr)
@@ -250,22 +284,7 @@ int isModulePresent(JNIEnv* env, jobject obj) {
     return getModuleEntry(env, obj) != nullptr ? 1 : 0;
 }
 
-ModuleEntry* getModuleEntryByName(const char* name) {
-    if (name != nullptr)
-        VOK_LOGD("module name passed %s", name);
-    else
-        VOK_LOGD("module name passed NULL");
-
-    ThreadEnv thread = envForCurrentThread();
-    if (thread.env == nullptr) return nullptr;
-    // A thread attached above stays attached on this return; long-standing
-    // behaviour, kept.
-    if (moduleListLock == nullptr) return nullptr;
-
-    ModuleEntry* entry = findByName(thread.env, name);
-    if (thread.attached) gJavaVM->DetachCurrentThread();
-    return entry;
-}
+ModuleEntry* getModuleEntryByName(const char* name) { return lookUpByName(name, false); }
 
 int keepThreadAttachedToJavaVm(void) {
     JavaVM* vm = gJavaVM;
@@ -283,19 +302,18 @@ int keepThreadAttachedToJavaVm(void) {
 }
 
 CK_FUNCTION_LIST_PTR getFunctionsByModule(const char* name) {
-    VOK_LOGD(" %s", __func__);
-    ModuleEntry* entry = getModuleEntryByName(name);
-    if (entry == nullptr) {
-        // Logged twice: long-standing output, kept.
-        VOK_LOGD("failed getting module entry");
-        VOK_LOGD("failed getting module entry");
-        return nullptr;
-    }
-    if (entry->functionList == nullptr) {
-        VOK_LOGD("ckpFunctions is null %s", __func__);
-        return nullptr;
-    }
-    return entry->functionList;
+    VOK_LOGD(" %s", "getFunctionsByModule");
+    return functionsOf(getModuleEntryByName(name));
+}
+
+ModuleHold::ModuleHold(const char* name) {
+    VOK_LOGD(" %s", "getFunctionsByModule");
+    entry_ = lookUpByName(name, true);
+    functions_ = functionsOf(entry_);
+}
+
+ModuleHold::~ModuleHold() {
+    if (entry_ != nullptr) releaseModuleEntry(entry_);
 }
 
 ModuleEntry* removeModuleEntry(JNIEnv* env, jobject obj) {

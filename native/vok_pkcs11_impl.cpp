@@ -10,6 +10,14 @@
 
 namespace {
 enum class ResultLog { Int, UnsignedLongLong, None };
+
+// A module whose list leaves the entry NULL does not offer the function:
+// answered so instead of calling through NULL (a departure from forwarding
+// blindly).
+template <class Function, class... Args>
+CK_RV offered(Function function, Args... args) {
+    return function != nullptr ? function(args...) : CKR_FUNCTION_NOT_SUPPORTED;
+}
 }  // namespace
 
 // Hidden: callers reach it only through IVokPkcs11's virtual methods.
@@ -17,6 +25,7 @@ class VokPkcs11Impl final : public IVokPkcs11 {
 public:
     explicit VokPkcs11Impl(const char* name) : moduleName(name ? strdup(name) : nullptr) {}
     ~VokPkcs11Impl() override { free(moduleName); }
+    bool bound() const { return moduleName != nullptr; }
     VokPkcs11Impl(const VokPkcs11Impl&) = delete;
     VokPkcs11Impl& operator=(const VokPkcs11Impl&) = delete;
 
@@ -159,7 +168,9 @@ private:
     template <class Call>
     CK_RV forward(const char* function, ResultLog log, Call&& call) const {
         VOK_LOGD("%s...", function);
-        CK_FUNCTION_LIST_PTR functions = getFunctionsByModule(moduleName);
+        // Held until the call returns: a disconnect meanwhile does not unload it.
+        ModuleHold module(moduleName);
+        CK_FUNCTION_LIST_PTR functions = module.functions();
         if (!functions) {
             VOK_LOGD("getFunctions return NULL");
             return CKR_FUNCTION_FAILED;
@@ -179,22 +190,28 @@ private:
 IVokPkcs11::~IVokPkcs11() {}
 
 IVokPkcs11* IVokPkcs11::getInstance(const char* moduleName) {
-    return new (std::nothrow) VokPkcs11Impl(moduleName);
+    VokPkcs11Impl* instance = new (std::nothrow) VokPkcs11Impl(moduleName);
+    // A name that could not be copied must not turn into "the first module".
+    if (instance != nullptr && moduleName != nullptr && !instance->bound()) {
+        delete instance;
+        return nullptr;
+    }
+    return instance;
 }
 
 CK_RV VokPkcs11Impl::C_Initialize(CK_VOID_PTR pInitArgs) {
     return forward("C_Initialize", ResultLog::Int,
-                   [&](CK_FUNCTION_LIST_PTR f) { return f->C_Initialize(pInitArgs); });
+                   [&](CK_FUNCTION_LIST_PTR f) { return offered(f->C_Initialize, pInitArgs); });
 }
 
 CK_RV VokPkcs11Impl::C_Finalize(CK_VOID_PTR pReserved) {
     return forward("C_Finalize", ResultLog::Int,
-                   [&](CK_FUNCTION_LIST_PTR f) { return f->C_Finalize(pReserved); });
+                   [&](CK_FUNCTION_LIST_PTR f) { return offered(f->C_Finalize, pReserved); });
 }
 
 CK_RV VokPkcs11Impl::C_GetInfo(CK_INFO_PTR pInfo) {
     return forward("C_GetInfo", ResultLog::Int,
-                   [&](CK_FUNCTION_LIST_PTR f) { return f->C_GetInfo(pInfo); });
+                   [&](CK_FUNCTION_LIST_PTR f) { return offered(f->C_GetInfo, pInfo); });
 }
 
 // Not offered through this interface: callers already have the module.
@@ -205,80 +222,84 @@ CK_RV VokPkcs11Impl::C_GetFunctionList(CK_FUNCTION_LIST_PTR_PTR) {
 CK_RV VokPkcs11Impl::C_GetSlotList(CK_BBOOL tokenPresent, CK_SLOT_ID_PTR pSlotList,
                                    CK_ULONG_PTR pulCount) {
     return forward("C_GetSlotList", ResultLog::Int, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_GetSlotList(tokenPresent, pSlotList, pulCount);
+        return offered(f->C_GetSlotList, tokenPresent, pSlotList, pulCount);
     });
 }
 
 CK_RV VokPkcs11Impl::C_GetSlotInfo(CK_SLOT_ID slotID, CK_SLOT_INFO_PTR pInfo) {
-    return forward("C_GetSlotInfo", ResultLog::Int,
-                   [&](CK_FUNCTION_LIST_PTR f) { return f->C_GetSlotInfo(slotID, pInfo); });
+    return forward("C_GetSlotInfo", ResultLog::Int, [&](CK_FUNCTION_LIST_PTR f) {
+        return offered(f->C_GetSlotInfo, slotID, pInfo);
+    });
 }
 
 CK_RV VokPkcs11Impl::C_GetTokenInfo(CK_SLOT_ID slotID, CK_TOKEN_INFO_PTR pInfo) {
-    return forward("C_GetTokenInfo", ResultLog::Int,
-                   [&](CK_FUNCTION_LIST_PTR f) { return f->C_GetTokenInfo(slotID, pInfo); });
+    return forward("C_GetTokenInfo", ResultLog::Int, [&](CK_FUNCTION_LIST_PTR f) {
+        return offered(f->C_GetTokenInfo, slotID, pInfo);
+    });
 }
 
 CK_RV VokPkcs11Impl::C_GetMechanismList(CK_SLOT_ID slotID, CK_MECHANISM_TYPE_PTR pMechanismList,
                                         CK_ULONG_PTR pulCount) {
     return forward("C_GetMechanismList", ResultLog::Int, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_GetMechanismList(slotID, pMechanismList, pulCount);
+        return offered(f->C_GetMechanismList, slotID, pMechanismList, pulCount);
     });
 }
 
 CK_RV VokPkcs11Impl::C_GetMechanismInfo(CK_SLOT_ID slotID, CK_MECHANISM_TYPE type,
                                         CK_MECHANISM_INFO_PTR pInfo) {
     return forward("C_GetMechanismInfo", ResultLog::Int, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_GetMechanismInfo(slotID, type, pInfo);
+        return offered(f->C_GetMechanismInfo, slotID, type, pInfo);
     });
 }
 
 CK_RV VokPkcs11Impl::C_InitToken(CK_SLOT_ID slotID, CK_UTF8CHAR_PTR pPin, CK_ULONG ulPinLen,
                                  CK_UTF8CHAR_PTR pLabel) {
     return forward("C_InitToken", ResultLog::Int, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_InitToken(slotID, pPin, ulPinLen, pLabel);
+        return offered(f->C_InitToken, slotID, pPin, ulPinLen, pLabel);
     });
 }
 
 CK_RV VokPkcs11Impl::C_InitPIN(CK_SESSION_HANDLE hSession, CK_UTF8CHAR_PTR pPin,
                                CK_ULONG ulPinLen) {
-    return forward("C_InitPIN", ResultLog::Int,
-                   [&](CK_FUNCTION_LIST_PTR f) { return f->C_InitPIN(hSession, pPin, ulPinLen); });
+    return forward("C_InitPIN", ResultLog::Int, [&](CK_FUNCTION_LIST_PTR f) {
+        return offered(f->C_InitPIN, hSession, pPin, ulPinLen);
+    });
 }
 
 CK_RV VokPkcs11Impl::C_SetPIN(CK_SESSION_HANDLE hSession, CK_UTF8CHAR_PTR pOldPin,
                               CK_ULONG ulOldLen, CK_UTF8CHAR_PTR pNewPin, CK_ULONG ulNewLen) {
     return forward("C_SetPIN", ResultLog::Int, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_SetPIN(hSession, pOldPin, ulOldLen, pNewPin, ulNewLen);
+        return offered(f->C_SetPIN, hSession, pOldPin, ulOldLen, pNewPin, ulNewLen);
     });
 }
 
 CK_RV VokPkcs11Impl::C_OpenSession(CK_SLOT_ID slotID, CK_FLAGS flags, CK_VOID_PTR pApplication,
                                    CK_NOTIFY Notify, CK_SESSION_HANDLE_PTR phSession) {
     return forward("C_OpenSession", ResultLog::Int, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_OpenSession(slotID, flags, pApplication, Notify, phSession);
+        return offered(f->C_OpenSession, slotID, flags, pApplication, Notify, phSession);
     });
 }
 
 CK_RV VokPkcs11Impl::C_CloseSession(CK_SESSION_HANDLE hSession) {
     return forward("C_CloseSession", ResultLog::Int,
-                   [&](CK_FUNCTION_LIST_PTR f) { return f->C_CloseSession(hSession); });
+                   [&](CK_FUNCTION_LIST_PTR f) { return offered(f->C_CloseSession, hSession); });
 }
 
 CK_RV VokPkcs11Impl::C_CloseAllSessions(CK_SLOT_ID slotID) {
     return forward("C_CloseAllSessions", ResultLog::Int,
-                   [&](CK_FUNCTION_LIST_PTR f) { return f->C_CloseAllSessions(slotID); });
+                   [&](CK_FUNCTION_LIST_PTR f) { return offered(f->C_CloseAllSessions, slotID); });
 }
 
 CK_RV VokPkcs11Impl::C_GetSessionInfo(CK_SESSION_HANDLE hSession, CK_SESSION_INFO_PTR pInfo) {
-    return forward("C_GetSessionInfo", ResultLog::Int,
-                   [&](CK_FUNCTION_LIST_PTR f) { return f->C_GetSessionInfo(hSession, pInfo); });
+    return forward("C_GetSessionInfo", ResultLog::Int, [&](CK_FUNCTION_LIST_PTR f) {
+        return offered(f->C_GetSessionInfo, hSession, pInfo);
+    });
 }
 
 CK_RV VokPkcs11Impl::C_GetOperationState(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pOperationState,
                                          CK_ULONG_PTR pulOperationStateLen) {
     return forward("C_GetOperationState", ResultLog::Int, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_GetOperationState(hSession, pOperationState, pulOperationStateLen);
+        return offered(f->C_GetOperationState, hSession, pOperationState, pulOperationStateLen);
     });
 }
 
@@ -287,27 +308,27 @@ CK_RV VokPkcs11Impl::C_SetOperationState(CK_SESSION_HANDLE hSession, CK_BYTE_PTR
                                          CK_OBJECT_HANDLE hEncryptionKey,
                                          CK_OBJECT_HANDLE hAuthenticationKey) {
     return forward("C_SetOperationState", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_SetOperationState(hSession, pOperationState, ulOperationStateLen,
-                                      hEncryptionKey, hAuthenticationKey);
+        return offered(f->C_SetOperationState, hSession, pOperationState, ulOperationStateLen,
+                       hEncryptionKey, hAuthenticationKey);
     });
 }
 
 CK_RV VokPkcs11Impl::C_Login(CK_SESSION_HANDLE hSession, CK_USER_TYPE userType,
                              CK_UTF8CHAR_PTR pPin, CK_ULONG ulPinLen) {
     return forward("C_Login", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_Login(hSession, userType, pPin, ulPinLen);
+        return offered(f->C_Login, hSession, userType, pPin, ulPinLen);
     });
 }
 
 CK_RV VokPkcs11Impl::C_Logout(CK_SESSION_HANDLE hSession) {
     return forward("C_Logout", ResultLog::UnsignedLongLong,
-                   [&](CK_FUNCTION_LIST_PTR f) { return f->C_Logout(hSession); });
+                   [&](CK_FUNCTION_LIST_PTR f) { return offered(f->C_Logout, hSession); });
 }
 
 CK_RV VokPkcs11Impl::C_CreateObject(CK_SESSION_HANDLE hSession, CK_ATTRIBUTE_PTR pTemplate,
                                     CK_ULONG ulCount, CK_OBJECT_HANDLE_PTR phObject) {
     return forward("C_CreateObject", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_CreateObject(hSession, pTemplate, ulCount, phObject);
+        return offered(f->C_CreateObject, hSession, pTemplate, ulCount, phObject);
     });
 }
 
@@ -315,66 +336,69 @@ CK_RV VokPkcs11Impl::C_CopyObject(CK_SESSION_HANDLE hSession, CK_OBJECT_HANDLE h
                                   CK_ATTRIBUTE_PTR pTemplate, CK_ULONG ulCount,
                                   CK_OBJECT_HANDLE_PTR phNewObject) {
     return forward("C_CopyObject", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_CopyObject(hSession, hObject, pTemplate, ulCount, phNewObject);
+        return offered(f->C_CopyObject, hSession, hObject, pTemplate, ulCount, phNewObject);
     });
 }
 
 CK_RV VokPkcs11Impl::C_DestroyObject(CK_SESSION_HANDLE hSession, CK_OBJECT_HANDLE hObject) {
-    return forward("C_DestroyObject", ResultLog::UnsignedLongLong,
-                   [&](CK_FUNCTION_LIST_PTR f) { return f->C_DestroyObject(hSession, hObject); });
+    return forward("C_DestroyObject", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
+        return offered(f->C_DestroyObject, hSession, hObject);
+    });
 }
 
 CK_RV VokPkcs11Impl::C_GetObjectSize(CK_SESSION_HANDLE hSession, CK_OBJECT_HANDLE hObject,
                                      CK_ULONG_PTR pulSize) {
     return forward("C_GetObjectSize", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_GetObjectSize(hSession, hObject, pulSize);
+        return offered(f->C_GetObjectSize, hSession, hObject, pulSize);
     });
 }
 
 CK_RV VokPkcs11Impl::C_GetAttributeValue(CK_SESSION_HANDLE hSession, CK_OBJECT_HANDLE hObject,
                                          CK_ATTRIBUTE_PTR pTemplate, CK_ULONG ulCount) {
     return forward("C_GetAttributeValue", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_GetAttributeValue(hSession, hObject, pTemplate, ulCount);
+        return offered(f->C_GetAttributeValue, hSession, hObject, pTemplate, ulCount);
     });
 }
 
 CK_RV VokPkcs11Impl::C_SetAttributeValue(CK_SESSION_HANDLE hSession, CK_OBJECT_HANDLE hObject,
                                          CK_ATTRIBUTE_PTR pTemplate, CK_ULONG ulCount) {
     return forward("C_SetAttributeValue", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_SetAttributeValue(hSession, hObject, pTemplate, ulCount);
+        return offered(f->C_SetAttributeValue, hSession, hObject, pTemplate, ulCount);
     });
 }
 
 CK_RV VokPkcs11Impl::C_FindObjectsInit(CK_SESSION_HANDLE hSession, CK_ATTRIBUTE_PTR pTemplate,
                                        CK_ULONG ulCount) {
     return forward("C_FindObjectsInit", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_FindObjectsInit(hSession, pTemplate, ulCount);
+        return offered(f->C_FindObjectsInit, hSession, pTemplate, ulCount);
     });
 }
 
 CK_RV VokPkcs11Impl::C_FindObjects(CK_SESSION_HANDLE hSession, CK_OBJECT_HANDLE_PTR phObject,
                                    CK_ULONG ulMaxObjectCount, CK_ULONG_PTR pulObjectCount) {
     return forward("C_FindObjects", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_FindObjects(hSession, phObject, ulMaxObjectCount, pulObjectCount);
+        return offered(f->C_FindObjects, hSession, phObject, ulMaxObjectCount, pulObjectCount);
     });
 }
 
 CK_RV VokPkcs11Impl::C_FindObjectsFinal(CK_SESSION_HANDLE hSession) {
-    return forward("C_FindObjectsFinal", ResultLog::UnsignedLongLong,
-                   [&](CK_FUNCTION_LIST_PTR f) { return f->C_FindObjectsFinal(hSession); });
+    return forward("C_FindObjectsFinal", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
+        return offered(f->C_FindObjectsFinal, hSession);
+    });
 }
 
 CK_RV VokPkcs11Impl::C_EncryptInit(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism,
                                    CK_OBJECT_HANDLE hKey) {
     return forward("C_EncryptInit", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_EncryptInit(hSession, pMechanism, hKey);
+        return offered(f->C_EncryptInit, hSession, pMechanism, hKey);
     });
 }
 
 CK_RV VokPkcs11Impl::C_Encrypt(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pData, CK_ULONG ulDataLen,
                                CK_BYTE_PTR pEncryptedData, CK_ULONG_PTR pulEncryptedDataLen) {
     return forward("C_Encrypt", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_Encrypt(hSession, pData, ulDataLen, pEncryptedData, pulEncryptedDataLen);
+        return offered(f->C_Encrypt, hSession, pData, ulDataLen, pEncryptedData,
+                       pulEncryptedDataLen);
     });
 }
 
@@ -382,21 +406,22 @@ CK_RV VokPkcs11Impl::C_EncryptUpdate(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pPa
                                      CK_ULONG ulPartLen, CK_BYTE_PTR pEncryptedPart,
                                      CK_ULONG_PTR pulEncryptedPartLen) {
     return forward("C_EncryptUpdate", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_EncryptUpdate(hSession, pPart, ulPartLen, pEncryptedPart, pulEncryptedPartLen);
+        return offered(f->C_EncryptUpdate, hSession, pPart, ulPartLen, pEncryptedPart,
+                       pulEncryptedPartLen);
     });
 }
 
 CK_RV VokPkcs11Impl::C_EncryptFinal(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pLastEncryptedPart,
                                     CK_ULONG_PTR pulLastEncryptedPartLen) {
     return forward("C_EncryptFinal", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_EncryptFinal(hSession, pLastEncryptedPart, pulLastEncryptedPartLen);
+        return offered(f->C_EncryptFinal, hSession, pLastEncryptedPart, pulLastEncryptedPartLen);
     });
 }
 
 CK_RV VokPkcs11Impl::C_DecryptInit(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism,
                                    CK_OBJECT_HANDLE hKey) {
     return forward("C_DecryptInit", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_DecryptInit(hSession, pMechanism, hKey);
+        return offered(f->C_DecryptInit, hSession, pMechanism, hKey);
     });
 }
 
@@ -404,7 +429,8 @@ CK_RV VokPkcs11Impl::C_Decrypt(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pEncrypte
                                CK_ULONG ulEncryptedDataLen, CK_BYTE_PTR pData,
                                CK_ULONG_PTR pulDataLen) {
     return forward("C_Decrypt", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_Decrypt(hSession, pEncryptedData, ulEncryptedDataLen, pData, pulDataLen);
+        return offered(f->C_Decrypt, hSession, pEncryptedData, ulEncryptedDataLen, pData,
+                       pulDataLen);
     });
 }
 
@@ -412,80 +438,82 @@ CK_RV VokPkcs11Impl::C_DecryptUpdate(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pEn
                                      CK_ULONG ulEncryptedPartLen, CK_BYTE_PTR pPart,
                                      CK_ULONG_PTR pulPartLen) {
     return forward("C_DecryptUpdate", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_DecryptUpdate(hSession, pEncryptedPart, ulEncryptedPartLen, pPart, pulPartLen);
+        return offered(f->C_DecryptUpdate, hSession, pEncryptedPart, ulEncryptedPartLen, pPart,
+                       pulPartLen);
     });
 }
 
 CK_RV VokPkcs11Impl::C_DecryptFinal(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pLastPart,
                                     CK_ULONG_PTR pulLastPartLen) {
     return forward("C_DecryptFinal", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_DecryptFinal(hSession, pLastPart, pulLastPartLen);
+        return offered(f->C_DecryptFinal, hSession, pLastPart, pulLastPartLen);
     });
 }
 
 CK_RV VokPkcs11Impl::C_DigestInit(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism) {
-    return forward("C_DigestInit", ResultLog::UnsignedLongLong,
-                   [&](CK_FUNCTION_LIST_PTR f) { return f->C_DigestInit(hSession, pMechanism); });
+    return forward("C_DigestInit", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
+        return offered(f->C_DigestInit, hSession, pMechanism);
+    });
 }
 
 CK_RV VokPkcs11Impl::C_Digest(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pData, CK_ULONG ulDataLen,
                               CK_BYTE_PTR pDigest, CK_ULONG_PTR pulDigestLen) {
     return forward("C_Digest", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_Digest(hSession, pData, ulDataLen, pDigest, pulDigestLen);
+        return offered(f->C_Digest, hSession, pData, ulDataLen, pDigest, pulDigestLen);
     });
 }
 
 CK_RV VokPkcs11Impl::C_DigestUpdate(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pPart,
                                     CK_ULONG ulPartLen) {
     return forward("C_DigestUpdate", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_DigestUpdate(hSession, pPart, ulPartLen);
+        return offered(f->C_DigestUpdate, hSession, pPart, ulPartLen);
     });
 }
 
 CK_RV VokPkcs11Impl::C_DigestKey(CK_SESSION_HANDLE hSession, CK_OBJECT_HANDLE hKey) {
     return forward("C_DigestKey", ResultLog::UnsignedLongLong,
-                   [&](CK_FUNCTION_LIST_PTR f) { return f->C_DigestKey(hSession, hKey); });
+                   [&](CK_FUNCTION_LIST_PTR f) { return offered(f->C_DigestKey, hSession, hKey); });
 }
 
 CK_RV VokPkcs11Impl::C_DigestFinal(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pDigest,
                                    CK_ULONG_PTR pulDigestLen) {
     return forward("C_DigestFinal", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_DigestFinal(hSession, pDigest, pulDigestLen);
+        return offered(f->C_DigestFinal, hSession, pDigest, pulDigestLen);
     });
 }
 
 CK_RV VokPkcs11Impl::C_SignInit(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism,
                                 CK_OBJECT_HANDLE hKey) {
     return forward("C_SignInit", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_SignInit(hSession, pMechanism, hKey);
+        return offered(f->C_SignInit, hSession, pMechanism, hKey);
     });
 }
 
 CK_RV VokPkcs11Impl::C_Sign(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pData, CK_ULONG ulDataLen,
                             CK_BYTE_PTR pSignature, CK_ULONG_PTR pulSignatureLen) {
     return forward("C_Sign", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_Sign(hSession, pData, ulDataLen, pSignature, pulSignatureLen);
+        return offered(f->C_Sign, hSession, pData, ulDataLen, pSignature, pulSignatureLen);
     });
 }
 
 CK_RV VokPkcs11Impl::C_SignUpdate(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pPart,
                                   CK_ULONG ulPartLen) {
     return forward("C_SignUpdate", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_SignUpdate(hSession, pPart, ulPartLen);
+        return offered(f->C_SignUpdate, hSession, pPart, ulPartLen);
     });
 }
 
 CK_RV VokPkcs11Impl::C_SignFinal(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pSignature,
                                  CK_ULONG_PTR pulSignatureLen) {
     return forward("C_SignFinal", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_SignFinal(hSession, pSignature, pulSignatureLen);
+        return offered(f->C_SignFinal, hSession, pSignature, pulSignatureLen);
     });
 }
 
 CK_RV VokPkcs11Impl::C_SignRecoverInit(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism,
                                        CK_OBJECT_HANDLE hKey) {
     return forward("C_SignRecoverInit", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_SignRecoverInit(hSession, pMechanism, hKey);
+        return offered(f->C_SignRecoverInit, hSession, pMechanism, hKey);
     });
 }
 
@@ -493,42 +521,42 @@ CK_RV VokPkcs11Impl::C_SignRecover(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pData
                                    CK_ULONG ulDataLen, CK_BYTE_PTR pSignature,
                                    CK_ULONG_PTR pulSignatureLen) {
     return forward("C_SignRecover", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_SignRecover(hSession, pData, ulDataLen, pSignature, pulSignatureLen);
+        return offered(f->C_SignRecover, hSession, pData, ulDataLen, pSignature, pulSignatureLen);
     });
 }
 
 CK_RV VokPkcs11Impl::C_VerifyInit(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism,
                                   CK_OBJECT_HANDLE hKey) {
     return forward("C_VerifyInit", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_VerifyInit(hSession, pMechanism, hKey);
+        return offered(f->C_VerifyInit, hSession, pMechanism, hKey);
     });
 }
 
 CK_RV VokPkcs11Impl::C_Verify(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pData, CK_ULONG ulDataLen,
                               CK_BYTE_PTR pSignature, CK_ULONG ulSignatureLen) {
     return forward("C_Verify", ResultLog::None, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_Verify(hSession, pData, ulDataLen, pSignature, ulSignatureLen);
+        return offered(f->C_Verify, hSession, pData, ulDataLen, pSignature, ulSignatureLen);
     });
 }
 
 CK_RV VokPkcs11Impl::C_VerifyUpdate(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pPart,
                                     CK_ULONG ulPartLen) {
     return forward("C_VerifyUpdate", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_VerifyUpdate(hSession, pPart, ulPartLen);
+        return offered(f->C_VerifyUpdate, hSession, pPart, ulPartLen);
     });
 }
 
 CK_RV VokPkcs11Impl::C_VerifyFinal(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pSignature,
                                    CK_ULONG ulSignatureLen) {
     return forward("C_VerifyFinal", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_VerifyFinal(hSession, pSignature, ulSignatureLen);
+        return offered(f->C_VerifyFinal, hSession, pSignature, ulSignatureLen);
     });
 }
 
 CK_RV VokPkcs11Impl::C_VerifyRecoverInit(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMechanism,
                                          CK_OBJECT_HANDLE hKey) {
     return forward("C_VerifyRecoverInit", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_VerifyRecoverInit(hSession, pMechanism, hKey);
+        return offered(f->C_VerifyRecoverInit, hSession, pMechanism, hKey);
     });
 }
 
@@ -536,7 +564,7 @@ CK_RV VokPkcs11Impl::C_VerifyRecover(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pSi
                                      CK_ULONG ulSignatureLen, CK_BYTE_PTR pData,
                                      CK_ULONG_PTR pulDataLen) {
     return forward("C_VerifyRecover", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_VerifyRecover(hSession, pSignature, ulSignatureLen, pData, pulDataLen);
+        return offered(f->C_VerifyRecover, hSession, pSignature, ulSignatureLen, pData, pulDataLen);
     });
 }
 
@@ -545,8 +573,8 @@ CK_RV VokPkcs11Impl::C_DigestEncryptUpdate(CK_SESSION_HANDLE hSession, CK_BYTE_P
                                            CK_ULONG_PTR pulEncryptedPartLen) {
     return forward("C_DigestEncryptUpdate", ResultLog::UnsignedLongLong,
                    [&](CK_FUNCTION_LIST_PTR f) {
-                       return f->C_DigestEncryptUpdate(hSession, pPart, ulPartLen, pEncryptedPart,
-                                                       pulEncryptedPartLen);
+                       return offered(f->C_DigestEncryptUpdate, hSession, pPart, ulPartLen,
+                                      pEncryptedPart, pulEncryptedPartLen);
                    });
 }
 
@@ -555,8 +583,8 @@ CK_RV VokPkcs11Impl::C_DecryptDigestUpdate(CK_SESSION_HANDLE hSession, CK_BYTE_P
                                            CK_ULONG_PTR pulPartLen) {
     return forward("C_DecryptDigestUpdate", ResultLog::UnsignedLongLong,
                    [&](CK_FUNCTION_LIST_PTR f) {
-                       return f->C_DecryptDigestUpdate(hSession, pEncryptedPart, ulEncryptedPartLen,
-                                                       pPart, pulPartLen);
+                       return offered(f->C_DecryptDigestUpdate, hSession, pEncryptedPart,
+                                      ulEncryptedPartLen, pPart, pulPartLen);
                    });
 }
 
@@ -564,8 +592,8 @@ CK_RV VokPkcs11Impl::C_SignEncryptUpdate(CK_SESSION_HANDLE hSession, CK_BYTE_PTR
                                          CK_ULONG ulPartLen, CK_BYTE_PTR pEncryptedPart,
                                          CK_ULONG_PTR pulEncryptedPartLen) {
     return forward("C_SignEncryptUpdate", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_SignEncryptUpdate(hSession, pPart, ulPartLen, pEncryptedPart,
-                                      pulEncryptedPartLen);
+        return offered(f->C_SignEncryptUpdate, hSession, pPart, ulPartLen, pEncryptedPart,
+                       pulEncryptedPartLen);
     });
 }
 
@@ -574,8 +602,8 @@ CK_RV VokPkcs11Impl::C_DecryptVerifyUpdate(CK_SESSION_HANDLE hSession, CK_BYTE_P
                                            CK_ULONG_PTR pulPartLen) {
     return forward("C_DecryptVerifyUpdate", ResultLog::UnsignedLongLong,
                    [&](CK_FUNCTION_LIST_PTR f) {
-                       return f->C_DecryptVerifyUpdate(hSession, pEncryptedPart, ulEncryptedPartLen,
-                                                       pPart, pulPartLen);
+                       return offered(f->C_DecryptVerifyUpdate, hSession, pEncryptedPart,
+                                      ulEncryptedPartLen, pPart, pulPartLen);
                    });
 }
 
@@ -583,7 +611,7 @@ CK_RV VokPkcs11Impl::C_GenerateKey(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR 
                                    CK_ATTRIBUTE_PTR pTemplate, CK_ULONG ulCount,
                                    CK_OBJECT_HANDLE_PTR phKey) {
     return forward("C_GenerateKey", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_GenerateKey(hSession, pMechanism, pTemplate, ulCount, phKey);
+        return offered(f->C_GenerateKey, hSession, pMechanism, pTemplate, ulCount, phKey);
     });
 }
 
@@ -595,9 +623,9 @@ CK_RV VokPkcs11Impl::C_GenerateKeyPair(CK_SESSION_HANDLE hSession, CK_MECHANISM_
                                        CK_OBJECT_HANDLE_PTR phPublicKey,
                                        CK_OBJECT_HANDLE_PTR phPrivateKey) {
     return forward("C_GenerateKeyPair", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_GenerateKeyPair(hSession, pMechanism, pPublicKeyTemplate,
-                                    ulPublicKeyAttributeCount, pPrivateKeyTemplate,
-                                    ulPrivateKeyAttributeCount, phPublicKey, phPrivateKey);
+        return offered(f->C_GenerateKeyPair, hSession, pMechanism, pPublicKeyTemplate,
+                       ulPublicKeyAttributeCount, pPrivateKeyTemplate, ulPrivateKeyAttributeCount,
+                       phPublicKey, phPrivateKey);
     });
 }
 
@@ -605,8 +633,8 @@ CK_RV VokPkcs11Impl::C_WrapKey(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pMec
                                CK_OBJECT_HANDLE hWrappingKey, CK_OBJECT_HANDLE hKey,
                                CK_BYTE_PTR pWrappedKey, CK_ULONG_PTR pulWrappedKeyLen) {
     return forward("C_WrapKey", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_WrapKey(hSession, pMechanism, hWrappingKey, hKey, pWrappedKey,
-                            pulWrappedKeyLen);
+        return offered(f->C_WrapKey, hSession, pMechanism, hWrappingKey, hKey, pWrappedKey,
+                       pulWrappedKeyLen);
     });
 }
 
@@ -615,8 +643,8 @@ CK_RV VokPkcs11Impl::C_UnwrapKey(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pM
                                  CK_ULONG ulWrappedKeyLen, CK_ATTRIBUTE_PTR pTemplate,
                                  CK_ULONG ulAttributeCount, CK_OBJECT_HANDLE_PTR phKey) {
     return forward("C_UnwrapKey", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_UnwrapKey(hSession, pMechanism, hUnwrappingKey, pWrappedKey, ulWrappedKeyLen,
-                              pTemplate, ulAttributeCount, phKey);
+        return offered(f->C_UnwrapKey, hSession, pMechanism, hUnwrappingKey, pWrappedKey,
+                       ulWrappedKeyLen, pTemplate, ulAttributeCount, phKey);
     });
 }
 
@@ -624,37 +652,39 @@ CK_RV VokPkcs11Impl::C_DeriveKey(CK_SESSION_HANDLE hSession, CK_MECHANISM_PTR pM
                                  CK_OBJECT_HANDLE hBaseKey, CK_ATTRIBUTE_PTR pTemplate,
                                  CK_ULONG ulAttributeCount, CK_OBJECT_HANDLE_PTR phKey) {
     return forward("C_DeriveKey", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_DeriveKey(hSession, pMechanism, hBaseKey, pTemplate, ulAttributeCount, phKey);
+        return offered(f->C_DeriveKey, hSession, pMechanism, hBaseKey, pTemplate, ulAttributeCount,
+                       phKey);
     });
 }
 
 CK_RV VokPkcs11Impl::C_SeedRandom(CK_SESSION_HANDLE hSession, CK_BYTE_PTR pSeed,
                                   CK_ULONG ulSeedLen) {
     return forward("C_SeedRandom", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_SeedRandom(hSession, pSeed, ulSeedLen);
+        return offered(f->C_SeedRandom, hSession, pSeed, ulSeedLen);
     });
 }
 
 CK_RV VokPkcs11Impl::C_GenerateRandom(CK_SESSION_HANDLE hSession, CK_BYTE_PTR RandomData,
                                       CK_ULONG ulRandomLen) {
     return forward("C_GenerateRandom", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_GenerateRandom(hSession, RandomData, ulRandomLen);
+        return offered(f->C_GenerateRandom, hSession, RandomData, ulRandomLen);
     });
 }
 
 CK_RV VokPkcs11Impl::C_GetFunctionStatus(CK_SESSION_HANDLE hSession) {
-    return forward("C_GetFunctionStatus", ResultLog::UnsignedLongLong,
-                   [&](CK_FUNCTION_LIST_PTR f) { return f->C_GetFunctionStatus(hSession); });
+    return forward("C_GetFunctionStatus", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
+        return offered(f->C_GetFunctionStatus, hSession);
+    });
 }
 
 CK_RV VokPkcs11Impl::C_CancelFunction(CK_SESSION_HANDLE hSession) {
     return forward("C_CancelFunction", ResultLog::None,
-                   [&](CK_FUNCTION_LIST_PTR f) { return f->C_CancelFunction(hSession); });
+                   [&](CK_FUNCTION_LIST_PTR f) { return offered(f->C_CancelFunction, hSession); });
 }
 
 CK_RV VokPkcs11Impl::C_WaitForSlotEvent(CK_FLAGS flags, CK_SLOT_ID_PTR pSlot,
                                         CK_VOID_PTR pReserved) {
     return forward("C_WaitForSlotEvent", ResultLog::UnsignedLongLong, [&](CK_FUNCTION_LIST_PTR f) {
-        return f->C_WaitForSlotEvent(flags, pSlot, pReserved);
+        return offered(f->C_WaitForSlotEvent, flags, pSlot, pReserved);
     });
 }

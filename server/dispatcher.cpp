@@ -3,12 +3,19 @@
 
 #include <cstdlib>
 #include <cstring>
+#include <mutex>
 #include <new>
+#include <optional>
 #include <string>
+
+#ifdef __GLIBC__
+#include <malloc.h>
+#endif
 
 #include "comm_internal.h"
 #include "handler_frame.h"
 #include "marshal.h"
+#include "request_memory.h"
 #include "vok_comm.h"
 #include "vok_registry.h"
 #include "vok_server.h"
@@ -21,7 +28,19 @@ pkcs11::Operation operation;
 CK_FUNCTION_LIST_PTR ckpFunctions = nullptr;
 CK_RV rv = 0;
 
+char* (*gModuleNameCopy)(const char*) = strdup;
+
 namespace {
+
+// mModuleName is set from Java threads (connect) while the server thread
+// reads it: every write, and the server thread's copy of it, hold this lock.
+std::mutex moduleNameLock;
+// The last name could not be copied: no module serves until the next one.
+bool moduleNameLost = false;
+
+// A request that made the service take this much is followed by giving the
+// freed memory back to the system.
+constexpr size_t kTrimAfter = size_t{4} << 20;
 
 using Handler = std::string (*)(const std::string&);
 
@@ -102,21 +121,52 @@ const Command kCommands[] = {
     {"C_WaitForSlotEvent", C_WaitForSlotEvent_Server},
 };
 
+// The registry name to serve from: set (the current name or NULL) or lost.
+struct ServedName {
+    bool lost;
+    bool set;
+    std::string name;
+};
+
+ServedName servedName() {
+    std::lock_guard<std::mutex> lock(moduleNameLock);
+    if (moduleNameLost) return {true, false, std::string()};
+    if (mModuleName == nullptr) return {false, false, std::string()};
+    return {false, true, std::string(mModuleName)};
+}
+
 // No command name ever matches "C_GetFunctionList": the client serves it.
-std::string dispatch(const void* request, int32_t length) {
+std::string dispatch(const void* request, size_t size) {
+    // A request whose parse alone would cost the service more than its
+    // allowance is answered like one nobody serves (a departure: the parse
+    // used to take whatever the request's structure asked for).
+    if (!vok::server::parseAffordable(request, size)) {
+        VOK_LOGE("Request of %d bytes not served: beyond its memory allowance",
+                 static_cast<int>(size));
+        return std::string();
+    }
     // A malformed request simply matches nothing.
-    operation.ParseFromArray(request, request != nullptr && length > 0 ? length : 0);
-    ckpFunctions = getFunctionsByModule(mModuleName);
-    const char* name = operation.name().c_str();
+    operation.ParseFromArray(request, static_cast<int>(size));
+    const std::string name = operation.name().c_str();
+
+    // Departs from a bare lookup: the module stays loaded until the handler
+    // returns, even if disconnect takes it out of the registry meanwhile.
+    const ServedName served = servedName();
+    std::optional<ModuleHold> module;
+    if (!served.lost) module.emplace(served.set ? served.name.c_str() : nullptr);
+    ckpFunctions = module ? module->functions() : nullptr;
+    std::string answer;
     for (const Command& command : kCommands) {
-        if (std::strcmp(name, command.name) != 0) continue;
+        if (name != command.name) continue;
         VOK_LOGD("Generate_Operation_Result %s", command.name);
         // The handler finds the request parsed already: a large one is not
         // copied and parsed a second time.
-        vok::server::ParsedRequest parsed;
-        return command.handler(std::string());
+        vok::server::ParsedRequest parsed(size);
+        answer = command.handler(std::string());
+        break;
     }
-    return std::string();
+    ckpFunctions = nullptr;  // not to be used once the module is released
+    return answer;
 }
 
 // The server thread looks its module up for every command. It attaches itself
@@ -145,14 +195,19 @@ int32_t vokpkcs11_server_getLastUsageTime(void) {
 }
 
 int32_t setModuleName_Server(const char* name) {
+    std::lock_guard<std::mutex> lock(moduleNameLock);
     if (name == nullptr) {
         // The previous copy is dropped without being freed; long-standing
         // behaviour, kept.
         mModuleName = nullptr;
+        moduleNameLost = false;
         return 0;
     }
     std::free(mModuleName);
-    mModuleName = strdup(name);
+    mModuleName = gModuleNameCopy(name);
+    // A copy that failed leaves no module to serve, where it used to leave
+    // NULL, which serves the first module registered.
+    moduleNameLost = mModuleName == nullptr;
     return 0;
 }
 
@@ -161,12 +216,18 @@ int32_t Generate_Operation_Result_Server(const void* request, int32_t requestLen
     if (response == nullptr || responseLength == nullptr) return 0;
     keepServerThreadAttached();
     std::string result;
+    const size_t size = request != nullptr && requestLength > 0 ? static_cast<size_t>(requestLength) : 0;
     try {
-        result = dispatch(request, requestLength);
+        result = dispatch(request, size);
     } catch (...) {
         // Out of memory before a handler ran: answered like an unknown command.
         result.clear();
     }
+    // Nothing of the request outlives its answer, and its PINs are wiped first.
+    vok::server::releaseRequest();
+#ifdef __GLIBC__
+    if (size + result.size() >= kTrimAfter) malloc_trim(0);
+#endif
     if (result.size() > vok::server::kFrameLimit) result.clear();
     // A failed allocation also leaves the empty answer.
     uint8_t* buffer = new (std::nothrow) uint8_t[result.size()];

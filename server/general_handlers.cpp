@@ -11,19 +11,20 @@ using namespace vok::server;
 // The service decides how its module is initialised: whatever the client
 // sent, the module gets no arguments.
 std::string C_Initialize_Server(const std::string& request) {
-    return serve(request, "C_Initialize",
-                 [](pkcs11::OperationResult&) { rv = ckpFunctions->C_Initialize(nullptr); });
+    return serve(request, "C_Initialize", [](pkcs11::OperationResult&) {
+        rv = offered(ckpFunctions->C_Initialize)(nullptr);
+    });
 }
 
 std::string C_Finalize_Server(const std::string& request) {
     return serve(request, "C_Finalize",
-                 [](pkcs11::OperationResult&) { rv = ckpFunctions->C_Finalize(nullptr); });
+                 [](pkcs11::OperationResult&) { rv = offered(ckpFunctions->C_Finalize)(nullptr); });
 }
 
 std::string C_GetInfo_Server(const std::string& request) {
     return serve(request, "C_GetInfo", [](pkcs11::OperationResult& res) {
         CK_INFO info{};
-        rv = ckpFunctions->C_GetInfo(&info);
+        rv = offered(ckpFunctions->C_GetInfo)(&info);
         putInfo(res.mutable_infores()->mutable_ckinfo(), info);
     });
 }

@@ -8,6 +8,7 @@
 #include <string>
 
 #include "marshal.h"
+#include "request_memory.h"
 #include "vok_server.h"
 
 namespace vok {
@@ -19,17 +20,30 @@ std::string serialised(const pkcs11::OperationResult& response);
 // The answer to a request the module was not called for: name and code only.
 std::string refused(const char* responseName, CK_RV result) noexcept;
 
-// While one lives, `operation` already holds the request the handler is given,
-// and serve() does not parse it again.
+// The module's entry for one function. A list that leaves it NULL does not
+// offer the function: answered CKR_FUNCTION_NOT_SUPPORTED instead of calling
+// through NULL (a departure from forwarding every command blindly).
+template <class Function>
+Function offered(Function function) {
+    if (function == nullptr) throw Refusal{CKR_FUNCTION_NOT_SUPPORTED};
+    return function;
+}
+
+// While one lives, `operation` already holds the request (of `size` bytes)
+// that the handler is given, and serve() does not parse it again.
 class ParsedRequest {
 public:
-    ParsedRequest() { parsed() = true; }
-    ~ParsedRequest() { parsed() = false; }
+    explicit ParsedRequest(size_t size) { current() = {true, size}; }
+    ~ParsedRequest() { current() = {false, 0}; }
     ParsedRequest(const ParsedRequest&) = delete;
     ParsedRequest& operator=(const ParsedRequest&) = delete;
-    static bool& parsed() {
-        static bool value = false;
-        return value;
+    struct State {
+        bool parsed;
+        size_t size;
+    };
+    static State& current() {
+        static State state = {false, 0};
+        return state;
     }
 };
 
@@ -37,23 +51,30 @@ public:
 // `operation`, stores the module's return value in `rv` and fills the answer's
 // sub-message whatever `rv` is. A Refusal it throws is answered with its code;
 // whatever else it throws (in practice sizes from the request that cannot be
-// allocated) ends in the empty answer, the one the client also gets for a
-// command nobody serves.
+// allocated, or beyond the request's buffer allowance) ends in the empty
+// answer, the one the client also gets for a command nobody serves. The
+// parsed request is wiped and released before the answer leaves.
 template <class Body>
 std::string serve(const std::string& request, const char* responseName, Body&& body) noexcept {
+    std::string answer;
     try {
-        if (!ParsedRequest::parsed()) operation.ParseFromString(request);
-        if (ckpFunctions == nullptr) return std::string();
-        pkcs11::OperationResult response;
-        response.set_name(responseName);
-        body(response);
-        response.set_result(rv);
-        return serialised(response);
+        const ParsedRequest::State parsed = ParsedRequest::current();
+        BufferBudget budget(parsed.parsed ? parsed.size : request.size());
+        if (!parsed.parsed) operation.ParseFromString(request);
+        if (ckpFunctions != nullptr) {
+            pkcs11::OperationResult response;
+            response.set_name(responseName);
+            body(response);
+            response.set_result(rv);
+            answer = serialised(response);
+        }
     } catch (const Refusal& refusal) {
-        return refused(responseName, refusal.rv);
+        answer = refused(responseName, refusal.rv);
     } catch (...) {
-        return std::string();
+        answer.clear();
     }
+    releaseRequest();
+    return answer;
 }
 
 }  // namespace server

@@ -14,8 +14,8 @@ std::string C_GenerateKey_Server(const std::string& request) {
         NativeMechanism mechanism(VOK_SENT(m, pmechanism));
         NativeTemplate tmpl(m.ptemplate(), m.ulcount(), kInputTemplate);
         CK_OBJECT_HANDLE key = 0;
-        rv = ckpFunctions->C_GenerateKey(m.hsession(), mechanism.get(), tmpl.data(), tmpl.count(),
-                                         &key);
+        rv = offered(ckpFunctions->C_GenerateKey)(m.hsession(), mechanism.get(), tmpl.data(),
+                                                  tmpl.count(), &key);
         res.mutable_generatekeyres()->set_phkey(key);
         mechanism.answerOutputs(res.mutable_generatekeyres());
     });
@@ -30,9 +30,9 @@ std::string C_GenerateKeyPair_Server(const std::string& request) {
         NativeTemplate privateTmpl(m.pprivatekeytemplate(), m.ulprivatekeyattributecount(),
                                    kInputTemplate);
         CK_OBJECT_HANDLE publicKey = 0, privateKey = 0;
-        rv = ckpFunctions->C_GenerateKeyPair(m.hsession(), mechanism.get(), publicTmpl.data(),
-                                             publicTmpl.count(), privateTmpl.data(),
-                                             privateTmpl.count(), &publicKey, &privateKey);
+        rv = offered(ckpFunctions->C_GenerateKeyPair)(
+            m.hsession(), mechanism.get(), publicTmpl.data(), publicTmpl.count(),
+            privateTmpl.data(), privateTmpl.count(), &publicKey, &privateKey);
         res.mutable_generatekeypairres()->set_phpublickey(publicKey);
         res.mutable_generatekeypairres()->set_phprivatekey(privateKey);
     });
@@ -44,8 +44,8 @@ std::string C_WrapKey_Server(const std::string& request) {
         const pkcs11::C_WrapKey& m = operation.wrapkey();
         NativeMechanism mechanism(VOK_SENT(m, pmechanism));
         Output wrapped(VOK_SENT(m, pwrappedkey), m.pulwrappedkeylen());
-        rv = ckpFunctions->C_WrapKey(m.hsession(), mechanism.get(), m.hwrappingkey(), m.hkey(),
-                                     wrapped.data(), wrapped.length());
+        rv = offered(ckpFunctions->C_WrapKey)(m.hsession(), mechanism.get(), m.hwrappingkey(),
+                                              m.hkey(), wrapped.data(), wrapped.length());
         res.mutable_wrapkeyres()->set_pwrappedkey(wrapped.written());
         res.mutable_wrapkeyres()->set_pulwrappedkeylen(wrapped.reported());
     });
@@ -59,9 +59,9 @@ std::string C_UnWrapKey_Server(const std::string& request) {
         Input wrapped(VOK_SENT(m, pwrappedkey), m.ulwrappedkeylen());
         NativeTemplate tmpl(m.ptemplate(), m.ulattributecount(), kInputTemplate);
         CK_OBJECT_HANDLE key = 0;
-        rv = ckpFunctions->C_UnwrapKey(m.hsession(), mechanism.get(), m.hunwrappingkey(),
-                                       wrapped.data(), m.ulwrappedkeylen(), tmpl.data(),
-                                       tmpl.count(), &key);
+        rv = offered(ckpFunctions->C_UnwrapKey)(m.hsession(), mechanism.get(), m.hunwrappingkey(),
+                                                wrapped.data(), m.ulwrappedkeylen(), tmpl.data(),
+                                                tmpl.count(), &key);
         res.mutable_unwrapkeyres()->set_phkey(key);
         mechanism.answerOutputs(res.mutable_unwrapkeyres());
     });
@@ -75,8 +75,8 @@ std::string C_DeriveKey_Server(const std::string& request) {
         NativeMechanism mechanism(VOK_SENT(m, pmechanism));
         NativeTemplate tmpl(m.ptemplate(), m.ulattributecount(), kInputTemplate);
         CK_OBJECT_HANDLE key = 0;
-        rv = ckpFunctions->C_DeriveKey(m.hsession(), mechanism.get(), m.hbasekey(), tmpl.data(),
-                                       tmpl.count(), &key);
+        rv = offered(ckpFunctions->C_DeriveKey)(m.hsession(), mechanism.get(), m.hbasekey(),
+                                                tmpl.data(), tmpl.count(), &key);
         res.mutable_derivekeyres()->set_phkey(key);
         mechanism.answerOutputs(res.mutable_derivekeyres());
     });
@@ -86,7 +86,7 @@ std::string C_GenerateRandom_Server(const std::string& request) {
     return serve(request, "C_GenerateRandom", [](pkcs11::OperationResult& res) {
         const pkcs11::C_GenerateRandom& m = operation.generaterandom();
         Input random(VOK_SENT(m, randomdata), m.ulrandomlen());
-        rv = ckpFunctions->C_GenerateRandom(m.hsession(), random.data(), m.ulrandomlen());
+        rv = offered(ckpFunctions->C_GenerateRandom)(m.hsession(), random.data(), m.ulrandomlen());
         res.mutable_generaterandomres()->set_randomdata(random.leading(m.ulrandomlen()));
         res.mutable_generaterandomres()->set_ulrandomlen(m.ulrandomlen());
     });
@@ -97,7 +97,7 @@ std::string C_SeedRandom_Server(const std::string& request) {
     return serve(request, "C_SeedRandom", [](pkcs11::OperationResult& res) {
         const pkcs11::C_SeedRandom& m = operation.seedrandom();
         Input seed(VOK_SENT(m, pseed), m.ulseedlen());
-        rv = ckpFunctions->C_SeedRandom(m.hsession(), seed.data(), m.ulseedlen());
+        rv = offered(ckpFunctions->C_SeedRandom)(m.hsession(), seed.data(), m.ulseedlen());
         res.mutable_seedrandomres()->set_pseed(seed.leading(m.ulseedlen()));
         res.mutable_seedrandomres()->set_ulseedlen(m.ulseedlen());
     });
@@ -105,13 +105,13 @@ std::string C_SeedRandom_Server(const std::string& request) {
 
 std::string C_GetFunctionStatus_Server(const std::string& request) {
     return serve(request, "C_GetFunctionStatus", [](pkcs11::OperationResult&) {
-        rv = ckpFunctions->C_GetFunctionStatus(operation.getfunctionstatus().hsession());
+        rv = offered(ckpFunctions->C_GetFunctionStatus)(operation.getfunctionstatus().hsession());
     });
 }
 
 std::string C_CancelFunction_Server(const std::string& request) {
     return serve(request, "C_CancelFunction", [](pkcs11::OperationResult&) {
-        rv = ckpFunctions->C_CancelFunction(operation.cancelfunction().hsession());
+        rv = offered(ckpFunctions->C_CancelFunction)(operation.cancelfunction().hsession());
     });
 }
 
@@ -120,7 +120,8 @@ std::string C_CancelFunction_Server(const std::string& request) {
 std::string C_WaitForSlotEvent_Server(const std::string& request) {
     return serve(request, "C_WaitForSlotEvent", [](pkcs11::OperationResult& res) {
         CK_SLOT_ID slot = 0;
-        rv = ckpFunctions->C_WaitForSlotEvent(operation.waitforslotevent().flags(), &slot, nullptr);
+        rv = offered(ckpFunctions->C_WaitForSlotEvent)(operation.waitforslotevent().flags(), &slot,
+                                                       nullptr);
         res.mutable_waitforsloteventres()->set_pslot(slot);
     });
 }

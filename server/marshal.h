@@ -17,6 +17,7 @@
 #include <string>
 #include <vector>
 
+#include "request_memory.h"
 #include "vok_pkcs11.h"
 #include "vok_proto.h"
 
@@ -44,14 +45,21 @@ struct Refusal {
 };
 using NumberList = google::protobuf::RepeatedField<google::protobuf::uint64>;
 
-struct FreeDeleter {
-    void operator()(void* p) const noexcept { std::free(p); }
+// Wipes what the buffer held before releasing it: some hold PINs or
+// plaintext.
+struct WipingFree {
+    size_t bytes;
+    void operator()(void* p) const noexcept {
+        wipe(p, bytes);
+        std::free(p);
+    }
 };
 
 // `count` zero-filled elements from malloc. Never NULL, even for 0: the module
-// always receives a real pointer. A count beyond a frame's worth of bytes, or
-// memory that is not there, throws std::bad_alloc, which the handler frame
-// turns into the empty answer.
+// always receives a real pointer. A count beyond a frame's worth of bytes,
+// beyond what is left of the request's buffer allowance, or memory that is not
+// there, throws std::bad_alloc, which the handler frame turns into the empty
+// answer.
 template <class T>
 class Buffer {
 public:
@@ -59,8 +67,11 @@ public:
     static void checkCount(uint64_t count) {
         if (count > (sizeof(T) == 1 ? kFrameLimit : kMaxElements)) throw std::bad_alloc();
     }
-    explicit Buffer(uint64_t count) : count_(count) {
+    explicit Buffer(uint64_t count)
+        : data_(nullptr, WipingFree{static_cast<size_t>(count ? count : 1) * sizeof(T)}),
+          count_(count) {
         checkCount(count);
+        BufferBudget::charge(data_.get_deleter().bytes);
         data_.reset(
             static_cast<T*>(std::calloc(count ? static_cast<size_t>(count) : 1, sizeof(T))));
         if (!data_) throw std::bad_alloc();
@@ -69,7 +80,7 @@ public:
     uint64_t count() const { return count_; }
 
 private:
-    std::unique_ptr<T, FreeDeleter> data_;
+    std::unique_ptr<T, WipingFree> data_;
     uint64_t count_;
 };
 

@@ -13,7 +13,8 @@ std::string C_CreateObject_Server(const std::string& request) {
         const pkcs11::C_CreateObject& m = operation.createobject();
         NativeTemplate tmpl(m.ptemplate(), m.ulcount(), kInputTemplate);
         CK_OBJECT_HANDLE object = 0;
-        rv = ckpFunctions->C_CreateObject(m.hsession(), tmpl.data(), tmpl.count(), &object);
+        rv =
+            offered(ckpFunctions->C_CreateObject)(m.hsession(), tmpl.data(), tmpl.count(), &object);
         res.mutable_createobjectres()->add_phobject(object);
     });
 }
@@ -23,8 +24,8 @@ std::string C_CopyObject_Server(const std::string& request) {
         const pkcs11::C_CopyObject& m = operation.copyobject();
         NativeTemplate tmpl(m.ptemplate(), m.ulcount(), kInputTemplate);
         CK_OBJECT_HANDLE object = 0;
-        rv = ckpFunctions->C_CopyObject(m.hsession(), m.hobject(), tmpl.data(), tmpl.count(),
-                                        &object);
+        rv = offered(ckpFunctions->C_CopyObject)(m.hsession(), m.hobject(), tmpl.data(),
+                                                 tmpl.count(), &object);
         res.mutable_copyobjectres()->add_phnewobject(object);
     });
 }
@@ -34,7 +35,7 @@ std::string C_DestroyObject_Server(const std::string& request) {
     return serve(request, "C_DestroyObject", [](pkcs11::OperationResult&) {
         VOK_LOGD("C_DestroyObject ckpfunctions not null");
         const pkcs11::C_DestroyObject& m = operation.destoryobj();
-        rv = ckpFunctions->C_DestroyObject(m.hsession(), m.hobject());
+        rv = offered(ckpFunctions->C_DestroyObject)(m.hsession(), m.hobject());
     });
 }
 
@@ -42,7 +43,7 @@ std::string C_GetObjectSize_Server(const std::string& request) {
     return serve(request, "C_GetObjectSize", [](pkcs11::OperationResult& res) {
         const pkcs11::C_GetObjectSize& m = operation.getobjectsize();
         CK_ULONG size = 0;
-        rv = ckpFunctions->C_GetObjectSize(m.hsession(), m.hobject(), &size);
+        rv = offered(ckpFunctions->C_GetObjectSize)(m.hsession(), m.hobject(), &size);
         res.mutable_getobjectsizeres()->set_pulsize(size);
     });
 }
@@ -51,8 +52,8 @@ std::string C_GetAttributeValue_Server(const std::string& request) {
     return serve(request, "C_GetAttributeValue", [](pkcs11::OperationResult& res) {
         const pkcs11::C_GetAttributeValue& m = operation.attvalue();
         NativeTemplate tmpl(m.attribute(), m.ulcount(), kQueryTemplate);
-        rv =
-            ckpFunctions->C_GetAttributeValue(m.hsession(), m.hobject(), tmpl.data(), tmpl.count());
+        rv = offered(ckpFunctions->C_GetAttributeValue)(m.hsession(), m.hobject(), tmpl.data(),
+                                                        tmpl.count());
         pkcs11::C_GetAttributeValue_Response* out = res.mutable_attvalueres();
         out->set_ulcount(m.ulcount());
         tmpl.echo(out->mutable_attribute(), Echo::kDropUnavailable);
@@ -63,8 +64,8 @@ std::string C_SetAttributeValue_Server(const std::string& request) {
     return serve(request, "C_SetAttributeValue", [](pkcs11::OperationResult& res) {
         const pkcs11::C_SetAttributeValue& m = operation.setattributevalue();
         NativeTemplate tmpl(m.ptemplate(), m.ulcount(), kInputTemplate);
-        rv =
-            ckpFunctions->C_SetAttributeValue(m.hsession(), m.hobject(), tmpl.data(), tmpl.count());
+        rv = offered(ckpFunctions->C_SetAttributeValue)(m.hsession(), m.hobject(), tmpl.data(),
+                                                        tmpl.count());
         pkcs11::C_SetAttributeValue_Response* out = res.mutable_setattributevalueres();
         out->set_ulcount(m.ulcount());
         tmpl.echo(out->mutable_ptemplate(), Echo::kDropUnavailableLogged);
@@ -75,7 +76,7 @@ std::string C_FindObjectsInit_Server(const std::string& request) {
     return serve(request, "C_FindObjectsInit", [](pkcs11::OperationResult& res) {
         const pkcs11::C_FindObjectsInit& m = operation.findobjinit();
         NativeTemplate tmpl(m.attribute(), m.ulcount(), kSearchTemplate);
-        rv = ckpFunctions->C_FindObjectsInit(m.hsession(), tmpl.data(), tmpl.count());
+        rv = offered(ckpFunctions->C_FindObjectsInit)(m.hsession(), tmpl.data(), tmpl.count());
         pkcs11::C_FindObjectsInit_Response* out = res.mutable_findobjintres();
         out->set_ulcount(m.ulcount());
         tmpl.echo(out->mutable_attribute(), Echo::kVerbatim);
@@ -89,8 +90,8 @@ std::string C_FindObjects_Server(const std::string& request) {
         const pkcs11::C_FindObjects& m = operation.findobj();
         Buffer<CK_OBJECT_HANDLE> handles(m.ulmaxobjectcount());
         CK_ULONG found = 0;
-        rv =
-            ckpFunctions->C_FindObjects(m.hsession(), handles.data(), m.ulmaxobjectcount(), &found);
+        rv = offered(ckpFunctions->C_FindObjects)(m.hsession(), handles.data(),
+                                                  m.ulmaxobjectcount(), &found);
         pkcs11::C_FindObjects_Response* out = res.mutable_findobjres();
         if (found != 0 && found <= m.ulmaxobjectcount())
             appendNumbers(out->mutable_phobject(), handles.data(), found);
@@ -100,6 +101,6 @@ std::string C_FindObjects_Server(const std::string& request) {
 
 std::string C_FindObjectsFinal_Server(const std::string& request) {
     return serve(request, "C_FindObjectsFinal", [](pkcs11::OperationResult&) {
-        rv = ckpFunctions->C_FindObjectsFinal(operation.findobjfinal().hsession());
+        rv = offered(ckpFunctions->C_FindObjectsFinal)(operation.findobjfinal().hsession());
     });
 }

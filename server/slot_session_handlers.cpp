@@ -20,7 +20,7 @@ std::string C_GetSlotList_Server(const std::string& request) {
     return serve(request, "C_GetSlotList", [](pkcs11::OperationResult& res) {
         const pkcs11::C_GetSlotList& m = operation.slotlist();
         CountedList slots(operation.has_slotlist(), m.slotidlist(), m.pulcount(), kSlotListTexts);
-        rv = ckpFunctions->C_GetSlotList(m.tokenpresent(), slots.list(), slots.count());
+        rv = offered(ckpFunctions->C_GetSlotList)(m.tokenpresent(), slots.list(), slots.count());
         pkcs11::C_GetSlotList_Response* out = res.mutable_slotlistres();
         out->set_pulcount(slots.answer(out->mutable_slotidlist()));
     });
@@ -29,7 +29,7 @@ std::string C_GetSlotList_Server(const std::string& request) {
 std::string C_GetSlotInfo_Server(const std::string& request) {
     return serve(request, "C_GetSlotInfo", [](pkcs11::OperationResult& res) {
         CK_SLOT_INFO info{};
-        rv = ckpFunctions->C_GetSlotInfo(operation.slotinfo().slotid(), &info);
+        rv = offered(ckpFunctions->C_GetSlotInfo)(operation.slotinfo().slotid(), &info);
         putSlotInfo(res.mutable_slotinfores()->mutable_pinfo(), info);
     });
 }
@@ -37,7 +37,7 @@ std::string C_GetSlotInfo_Server(const std::string& request) {
 std::string C_GetTokenInfo_Server(const std::string& request) {
     return serve(request, "C_GetTokenInfo", [](pkcs11::OperationResult& res) {
         CK_TOKEN_INFO info{};
-        rv = ckpFunctions->C_GetTokenInfo(operation.tokeninfo().slotid(), &info);
+        rv = offered(ckpFunctions->C_GetTokenInfo)(operation.tokeninfo().slotid(), &info);
         putTokenInfo(res.mutable_tokeninfores()->mutable_pinfo(), info);
     });
 }
@@ -47,7 +47,7 @@ std::string C_GetMechanismList_Server(const std::string& request) {
         const pkcs11::C_GetMechanismList& m = operation.mechanismlist();
         CountedList types(operation.has_mechanismlist(), m.pmechanismlist(), m.pulcount(),
                           kMechanismListTexts);
-        rv = ckpFunctions->C_GetMechanismList(m.slotid(), types.list(), types.count());
+        rv = offered(ckpFunctions->C_GetMechanismList)(m.slotid(), types.list(), types.count());
         pkcs11::C_GetMechanismList_Response* out = res.mutable_mechanismlistres();
         out->set_pulcount(types.answer(out->mutable_pmechanismlist()));
     });
@@ -57,7 +57,7 @@ std::string C_GetMechanismInfo_Server(const std::string& request) {
     return serve(request, "C_GetMechanismInfo", [](pkcs11::OperationResult& res) {
         const pkcs11::C_GetMechanismInfo& m = operation.mechanisminfo();
         CK_MECHANISM_INFO info{};
-        rv = ckpFunctions->C_GetMechanismInfo(m.slotid(), m.type(), &info);
+        rv = offered(ckpFunctions->C_GetMechanismInfo)(m.slotid(), m.type(), &info);
         putMechanismInfo(res.mutable_mechanisminfores()->mutable_pinfo(), info);
     });
 }
@@ -67,8 +67,8 @@ std::string C_InitToken_Server(const std::string& request) {
         const pkcs11::C_InitToken& m = operation.inittoken();
         Input pin(VOK_SENT(m, ppin), m.ulpinlen());
         std::array<CK_UTF8CHAR, 32> label = paddedLabel(m.plabel());
-        rv = ckpFunctions->C_InitToken(m.slotid(), pin.data(), m.ulpinlen(),
-                                       m.has_plabel() ? label.data() : nullptr);
+        rv = offered(ckpFunctions->C_InitToken)(m.slotid(), pin.data(), m.ulpinlen(),
+                                                m.has_plabel() ? label.data() : nullptr);
     });
 }
 
@@ -76,7 +76,7 @@ std::string C_InitPin_Server(const std::string& request) {
     return serve(request, "C_InitPin", [](pkcs11::OperationResult&) {
         const pkcs11::C_InitPin& m = operation.initpin();
         Input pin(VOK_SENT(m, ppin), m.ulpinlen());
-        rv = ckpFunctions->C_InitPIN(m.hsession(), pin.data(), m.ulpinlen());
+        rv = offered(ckpFunctions->C_InitPIN)(m.hsession(), pin.data(), m.ulpinlen());
     });
 }
 
@@ -85,8 +85,8 @@ std::string C_SetPin_Server(const std::string& request) {
         const pkcs11::C_SetPin& m = operation.setpin();
         Input oldPin(VOK_SENT(m, poldpin), m.uloldlen());
         Input newPin(VOK_SENT(m, pnewpin), m.ulnewlen());
-        rv = ckpFunctions->C_SetPIN(m.hsession(), oldPin.data(), m.uloldlen(), newPin.data(),
-                                    m.ulnewlen());
+        rv = offered(ckpFunctions->C_SetPIN)(m.hsession(), oldPin.data(), m.uloldlen(),
+                                             newPin.data(), m.ulnewlen());
     });
 }
 
@@ -98,7 +98,8 @@ std::string C_OpenSession_Server(const std::string& request) {
         if (operation.has_openses()) VOK_LOGD("Opensession instance present");
         const pkcs11::C_OpenSession& m = operation.openses();
         CK_SESSION_HANDLE session = 0;
-        rv = ckpFunctions->C_OpenSession(m.slotid(), m.flags(), nullptr, nullptr, &session);
+        rv =
+            offered(ckpFunctions->C_OpenSession)(m.slotid(), m.flags(), nullptr, nullptr, &session);
         __android_log_print(ANDROID_LOG_DEBUG, "DDDD",
                             "session is %llx and CK_ULONG size is %d, CK_SESSION_HANDLE size is %d",
                             static_cast<unsigned long long>(session),
@@ -111,20 +112,20 @@ std::string C_OpenSession_Server(const std::string& request) {
 
 std::string C_CloseSession_Server(const std::string& request) {
     return serve(request, "C_CloseSession", [](pkcs11::OperationResult&) {
-        rv = ckpFunctions->C_CloseSession(operation.closeses().hsession());
+        rv = offered(ckpFunctions->C_CloseSession)(operation.closeses().hsession());
     });
 }
 
 std::string C_CloseAllSessions_Server(const std::string& request) {
     return serve(request, "C_CloseAllSessions", [](pkcs11::OperationResult&) {
-        rv = ckpFunctions->C_CloseAllSessions(operation.closeallsessions().slotid());
+        rv = offered(ckpFunctions->C_CloseAllSessions)(operation.closeallsessions().slotid());
     });
 }
 
 std::string C_GetSessionInfo_Server(const std::string& request) {
     return serve(request, "C_GetSessionInfo", [](pkcs11::OperationResult& res) {
         CK_SESSION_INFO info{};
-        rv = ckpFunctions->C_GetSessionInfo(operation.sessioninfo().hsession(), &info);
+        rv = offered(ckpFunctions->C_GetSessionInfo)(operation.sessioninfo().hsession(), &info);
         putSessionInfo(res.mutable_sessioninfores()->mutable_pinfo(), info);
     });
 }
@@ -133,7 +134,7 @@ std::string C_GetOperationState_Server(const std::string& request) {
     return serve(request, "C_GetOperationState", [](pkcs11::OperationResult& res) {
         const pkcs11::C_GetOperationState& m = operation.getoperationstate();
         Output state(m.has_poperationstate(), m.puloperationstatelen());
-        rv = ckpFunctions->C_GetOperationState(m.hsession(), state.data(), state.length());
+        rv = offered(ckpFunctions->C_GetOperationState)(m.hsession(), state.data(), state.length());
         pkcs11::C_GetOperationState_Response* out = res.mutable_getoperationstateres();
         out->set_poperationstate(state.written());
         out->set_puloperationstatelen(state.reported());
@@ -144,8 +145,9 @@ std::string C_SetOperationState_Server(const std::string& request) {
     return serve(request, "C_SetOperationState", [](pkcs11::OperationResult&) {
         const pkcs11::C_SetOperationState& m = operation.setoperationstate();
         Input state(VOK_SENT(m, poperationstate), m.uloperationstatelen());
-        rv = ckpFunctions->C_SetOperationState(m.hsession(), state.data(), m.uloperationstatelen(),
-                                               m.hencryptionkey(), m.hauthenticationkey());
+        rv = offered(ckpFunctions->C_SetOperationState)(m.hsession(), state.data(),
+                                                        m.uloperationstatelen(), m.hencryptionkey(),
+                                                        m.hauthenticationkey());
     });
 }
 
@@ -153,12 +155,12 @@ std::string C_Login_Server(const std::string& request) {
     return serve(request, "C_Login", [](pkcs11::OperationResult&) {
         const pkcs11::C_Login& m = operation.login();
         Input pin(VOK_SENT(m, ppin), m.ulpinlen());
-        rv = ckpFunctions->C_Login(m.hsession(), m.usertype(), pin.data(), m.ulpinlen());
+        rv = offered(ckpFunctions->C_Login)(m.hsession(), m.usertype(), pin.data(), m.ulpinlen());
     });
 }
 
 std::string C_Logout_Server(const std::string& request) {
     return serve(request, "C_Logout", [](pkcs11::OperationResult&) {
-        rv = ckpFunctions->C_Logout(operation.logout().hsession());
+        rv = offered(ckpFunctions->C_Logout)(operation.logout().hsession());
     });
 }

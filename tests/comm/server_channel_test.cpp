@@ -3,7 +3,11 @@
 
 #include <pthread.h>
 #include <sys/resource.h>
+#include <sys/socket.h>
 #include <sys/time.h>
+#include <sys/un.h>
+#include <sys/wait.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <array>
@@ -540,6 +544,62 @@ TEST_F(ServerChannelTest, SettingTheChannelUpAgainNeverMixesUpExchangesInFlight)
     setUp.join();
     EXPECT_EQ(0, wrong.load());
     EXPECT_GT(answered.load(), 0);
+}
+
+// Whether a client process running under `uid` gets its version command
+// answered. The child uses bare system calls only.
+bool answeredAs(uid_t uid, const std::string& serverId) {
+    const std::string name = abstractName(serverId);
+    const Bytes request = encodeFrame(kVersionRequest, int32Bytes(1));
+    const pid_t child = fork();
+    if (child == 0) {
+        if (setgid(uid) != 0 || setuid(uid) != 0) _exit(2);
+        int fd = socket(AF_UNIX, SOCK_STREAM, 0);
+        sockaddr_un address{};
+        address.sun_family = AF_UNIX;
+        std::memcpy(address.sun_path, name.data(), sizeof(address.sun_path));
+        timeval limit{5, 0};
+        setsockopt(fd, SOL_SOCKET, SO_RCVTIMEO, &limit, sizeof(limit));
+        uint8_t answer[20];
+        const bool answered =
+            connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address)) == 0 &&
+            send(fd, request.data(), request.size(), MSG_NOSIGNAL) ==
+                static_cast<ssize_t>(request.size()) &&
+            recv(fd, answer, sizeof(answer), MSG_WAITALL) == sizeof(answer);
+        _exit(answered ? 0 : 1);
+    }
+    int status = 0;
+    waitpid(child, &status, 0);
+    EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) != 2) << "could not take uid " << uid;
+    return WIFEXITED(status) && WEXITSTATUS(status) == 0;
+}
+
+TEST_F(ServerChannelTest, WithAnAllowListOnlyTheListedUsersAreServed) {
+    if (getuid() != 0) GTEST_SKIP() << "needs root to run a client under another user id";
+    const uint32_t root = 0, nobody = 65534;
+    startServer(id);
+    EXPECT_TRUE(answeredAs(nobody, id)) << "without a list everyone is served";
+    ASSERT_EQ(0, vokpkcs11_comm_server_setAllowedPeers(&root, 1));
+    EXPECT_FALSE(answeredAs(nobody, id));
+    EXPECT_TRUE(waitForLine("Client uid 65534 not allowed - connection closed"));
+    EXPECT_TRUE(answeredAs(root, id)) << "the next client is served";
+    ASSERT_EQ(0, vokpkcs11_comm_server_setAllowedPeers(&nobody, 1));
+    EXPECT_FALSE(answeredAs(root, id));
+    EXPECT_TRUE(answeredAs(nobody, id));
+    ASSERT_EQ(0, vokpkcs11_comm_server_setAllowedPeers(nullptr, 0));
+    EXPECT_TRUE(answeredAs(root, id));
+}
+
+// A header alone never makes the service take the memory it announces.
+TEST_F(ServerChannelTest, APayloadIsAllocatedOnlyAsItArrives) {
+    RawSocket& client = start();
+    const uint64_t before = addressSpaceInUse();
+    ASSERT_TRUE(client.sendHeader(commandHeader(INT32_MAX)));
+    ASSERT_TRUE(client.sendBytes(Bytes(1000, 7)));
+    ASSERT_TRUE(waitForLine("Bytes read:1000"));
+    EXPECT_LT(addressSpaceInUse(), before + (64u << 20));
+    client.close();
+    EXPECT_TRUE(waitForLine("Receive command data failed"));
 }
 
 }  // namespace

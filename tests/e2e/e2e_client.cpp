@@ -14,6 +14,11 @@
 //       without the library: sends the header of a request and half its
 //       payload by hand, prints "stalled" once the service has read all of it
 //       and waits for standard input to end.
+//   vok_e2e_client <library> <serverId> soak <rounds>
+//       for the soak test: rounds of mixed calls on fresh random data, one
+//       line each: "round ok", "round channel <call>" (the call got the
+//       channel's failure code; the client stops there) or "WRONG <call>:
+//       <why>" (any other answer than the one the data calls for).
 
 #include <dlfcn.h>
 #include <linux/sockios.h>
@@ -29,6 +34,7 @@
 #include <cstring>
 #include <functional>
 #include <iostream>
+#include <random>
 #include <string>
 #include <thread>
 #include <vector>
@@ -309,6 +315,79 @@ int runCalls(const Library& library, const std::vector<std::string>& functions) 
     return 0;
 }
 
+// ---- Rounds of mixed calls for the soak test ---------------------------------------
+
+// A round gives up at the channel's failure code: the service may be gone.
+struct ChannelLost {
+    std::string call;
+};
+
+void soakRv(const char* call, CK_RV rv, CK_RV expected, CK_RV alsoFine = CKR_OK) {
+    if (rv == kChannelFailure) throw ChannelLost{call};
+    if (rv != expected && rv != alsoFine) expectRv(call, rv, expected);
+}
+
+void soakRound(CK_FUNCTION_LIST_PTR f, std::mt19937& random) {
+    std::string value(1 + random() % 200, '\0'), plain(16 * (1 + random() % 4), '\0');
+    for (char& c : value) c = static_cast<char>(random());
+    for (char& c : plain) c = static_cast<char>(random());
+    soakRv("C_Initialize", f->C_Initialize(nullptr), CKR_OK, CKR_CRYPTOKI_ALREADY_INITIALIZED);
+    // Clients killed earlier leave their sessions open; only this one is served now.
+    soakRv("C_CloseAllSessions", f->C_CloseAllSessions(1), CKR_OK);
+    CK_INFO info{};
+    soakRv("C_GetInfo", f->C_GetInfo(&info), CKR_OK);
+    expectTrue(startsWith(info.manufacturerID, "Vok test vendor"), "C_GetInfo: manufacturerID");
+    CK_SESSION_HANDLE session = CK_INVALID_HANDLE;
+    soakRv("C_OpenSession",
+           f->C_OpenSession(1, CKF_SERIAL_SESSION | CKF_RW_SESSION, nullptr, nullptr, &session),
+           CKR_OK);
+    CK_OBJECT_CLASS dataClass = CKO_DATA;
+    CK_ATTRIBUTE object[] = {attribute(CKA_CLASS, &dataClass, sizeof dataClass),
+                             attribute(CKA_VALUE, value.data(), value.size())};
+    CK_OBJECT_HANDLE data = CK_INVALID_HANDLE, key = CK_INVALID_HANDLE;
+    soakRv("C_CreateObject", f->C_CreateObject(session, object, 2, &data), CKR_OK);
+    std::vector<char> read(value.size() + 8);
+    CK_ATTRIBUTE query = attribute(CKA_VALUE, read.data(), read.size());
+    soakRv("C_GetAttributeValue", f->C_GetAttributeValue(session, data, &query, 1), CKR_OK);
+    expectTrue(bytesOf(query) == value, "C_GetAttributeValue: another value");
+    CK_ULONG keyLength = 16;
+    CK_ATTRIBUTE valueLen = attribute(CKA_VALUE_LEN, &keyLength, sizeof keyLength);
+    CK_MECHANISM aes = {CKM_AES_KEY_GEN, nullptr, 0};
+    soakRv("C_GenerateKey", f->C_GenerateKey(session, &aes, &valueLen, 1, &key), CKR_OK);
+    std::vector<CK_BYTE> in(plain.begin(), plain.end()), out(plain.size() + 16);
+    CK_ULONG length = out.size();
+    soakRv("C_EncryptInit", f->C_EncryptInit(session, &kCbc, key), CKR_OK);
+    soakRv("C_Encrypt", f->C_Encrypt(session, in.data(), in.size(), out.data(), &length), CKR_OK);
+    expectTrue(length == plain.size() && text(out.data(), length) != plain, "C_Encrypt: output");
+    in.assign(out.begin(), out.begin() + length);
+    length = out.size();
+    soakRv("C_DecryptInit", f->C_DecryptInit(session, &kCbc, key), CKR_OK);
+    soakRv("C_Decrypt", f->C_Decrypt(session, in.data(), in.size(), out.data(), &length), CKR_OK);
+    expectTrue(text(out.data(), length) == plain, "C_Decrypt: another plaintext");
+    soakRv("C_DestroyObject", f->C_DestroyObject(session, data), CKR_OK);
+    soakRv("C_DestroyObject", f->C_DestroyObject(session, key), CKR_OK);
+    soakRv("C_CloseSession", f->C_CloseSession(session), CKR_OK);
+}
+
+int soak(const Library& library, int rounds) {
+    std::mt19937 random(static_cast<unsigned>(getpid()));
+    int wrong = 0;
+    for (int i = 0; i < rounds; ++i) {
+        try {
+            soakRound(library.functions, random);
+            std::cout << "round ok" << std::endl;
+        } catch (const ChannelLost& lost) {
+            // As an application would, it starts again in a new process.
+            std::cout << "round channel " << lost.call << std::endl;
+            break;
+        } catch (const Failure& failure) {
+            std::cout << "WRONG " << failure.why << std::endl;
+            ++wrong;
+        }
+    }
+    return wrong == 0 ? 0 : 1;
+}
+
 // ---- A request that never completes ---------------------------------------------
 
 bool sendAll(int fd, const void* data, size_t size) {
@@ -379,7 +458,8 @@ int main(int argc, char** argv) {
     if (args.size() < 3) {
         std::cerr << "usage: vok_e2e_client <library> <serverId> steps [--already-initialized]\n"
                      "       vok_e2e_client <library> <serverId> call <function>...\n"
-                     "       vok_e2e_client <library> <serverId> stall\n";
+                     "       vok_e2e_client <library> <serverId> stall\n"
+                     "       vok_e2e_client <library> <serverId> soak <rounds>\n";
         return 2;
     }
     const std::string& mode = args[2];
@@ -388,6 +468,8 @@ int main(int argc, char** argv) {
         bool alreadyInitialized = args.size() > 3 && args[3] == "--already-initialized";
         return runSteps(openLibrary(args[0].c_str(), args[1].c_str()), alreadyInitialized);
     }
+    if (mode == "soak" && args.size() > 3)
+        return soak(openLibrary(args[0].c_str(), args[1].c_str()), std::stoi(args[3]));
     if (mode == "call")
         return runCalls(openLibrary(args[0].c_str(), args[1].c_str()),
                         std::vector<std::string>(args.begin() + 3, args.end()));

@@ -16,6 +16,7 @@
 #include <cstdlib>
 #include <fstream>
 #include <memory>
+#include <sstream>
 #include <string>
 #include <thread>
 #include <vector>
@@ -29,11 +30,14 @@ using Clock = std::chrono::steady_clock;
 // error goes where the test's goes.
 class Process {
 public:
-    explicit Process(const std::vector<std::string>& argv) {
+    // runAs: the user id the child runs under; -1 keeps the test's.
+    explicit Process(const std::vector<std::string>& argv, uid_t runAs = static_cast<uid_t>(-1)) {
         int in[2], out[2];
         if (pipe2(in, O_CLOEXEC) != 0 || pipe2(out, O_CLOEXEC) != 0) return;
         pid_ = fork();
         if (pid_ == 0) {
+            if (runAs != static_cast<uid_t>(-1) && (setgid(runAs) != 0 || setuid(runAs) != 0))
+                _exit(126);
             dup2(in[0], STDIN_FILENO);
             dup2(out[1], STDOUT_FILENO);
             std::vector<char*> args;
@@ -214,9 +218,20 @@ protected:
         const auto* info = ::testing::UnitTest::GetInstance()->current_test_info();
         // The first character never reaches the socket's name.
         serverId_ = std::string("Xvok-e2e-") + std::to_string(getpid()) + "-" + info->name();
-        host_.reset(new Process(
-            {VOK_E2E_JAVA, "-Djava.library.path=" + directoryOf(VOK_E2E_WRAPPER), "-cp",
-             VOK_E2E_JAR, "com.vok.smartcard.pkcs11.ServiceHost", serverId_, VOK_E2E_FAKE_VENDOR}));
+        startHost({});
+    }
+
+    void startHost(const std::vector<std::string>& options) {
+        // Through env, which sets the sanitizer build's preloads for the host alone.
+        std::vector<std::string> argv = {"/usr/bin/env"};
+        std::istringstream environment(VOK_E2E_JAVA_ENVIRONMENT);
+        for (std::string setting; environment >> setting;) argv.push_back(setting);
+        argv.insert(argv.end(),
+                    {VOK_E2E_JAVA, "-Djava.library.path=" + directoryOf(VOK_E2E_WRAPPER), "-cp",
+                     VOK_E2E_JAR, "com.vok.smartcard.pkcs11.ServiceHost"});
+        argv.insert(argv.end(), options.begin(), options.end());
+        argv.insert(argv.end(), {serverId_, VOK_E2E_FAKE_VENDOR});
+        host_.reset(new Process(argv));
         ASSERT_EQ(host_->waitForLine("serving"), "serving " + serverId_) << host_->transcript();
     }
 
@@ -224,10 +239,11 @@ protected:
         return path.substr(0, path.rfind('/'));
     }
 
-    std::unique_ptr<Process> client(const std::vector<std::string>& args) {
+    std::unique_ptr<Process> client(const std::vector<std::string>& args,
+                                    uid_t runAs = static_cast<uid_t>(-1)) {
         std::vector<std::string> argv = {VOK_E2E_CLIENT, VOK_E2E_WRAPPER, serverId_};
         argv.insert(argv.end(), args.begin(), args.end());
-        return std::unique_ptr<Process>(new Process(argv));
+        return std::unique_ptr<Process>(new Process(argv, runAs));
     }
 
     // Runs the whole step table in a new client process.
@@ -342,6 +358,17 @@ TEST_F(ServiceE2eTest, ClientGetsAllOnesAtOnceWhenTheServiceIsKilledDuringACall)
     std::string after = caller->waitForLine("C_GetInfo", 25s);
     EXPECT_NE(after.find(kAllOnes), std::string::npos) << caller->transcript();
     EXPECT_TRUE(exitedWith(caller->wait(), 0));
+}
+
+TEST_F(ServiceE2eTest, AServiceWithAnAllowListServesOnlyTheUsersOnIt) {
+    if (getuid() != 0) GTEST_SKIP() << "needs root to run a client under another user id";
+    host_.reset();
+    serverId_ += "-allow";
+    startHost({"--allow-uids", "0"});
+    auto stranger = client({"call", "C_GetInfo"}, 65534);
+    EXPECT_EQ(stranger->waitForLine("FAIL"), "FAIL vokpkcs11_client_init: status 3")
+        << stranger->transcript();
+    expectEveryStepPasses();
 }
 
 }  // namespace

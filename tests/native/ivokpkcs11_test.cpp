@@ -4,11 +4,14 @@
 
 #include <gtest/gtest.h>
 
+#include <cstddef>
 #include <cstdlib>
 #include <cstring>
 #include <functional>
+#include <iterator>
 #include <memory>
 #include <string>
+#include <vector>
 
 #include "fake_vendor.h"
 #include "jvm_fixture.h"
@@ -177,6 +180,35 @@ TEST_F(NativeInterfaceTest, ArgumentsReachTheModuleUnchanged) {
     CK_BYTE random[8] = {};
     ASSERT_EQ(token->C_GenerateRandom(session, random, sizeof(random)), CKR_OK);
     EXPECT_EQ(fakevendor::lastCall("C_GenerateRandom").arg("ulRandomLen").number, 8u);
+}
+
+// Every argument zero or NULL: the calls below never reach a module.
+template <class... Args>
+CK_RV callWithZeros(IVokPkcs11* token, CK_RV (IVokPkcs11::*method)(Args...)) {
+    return (token->*method)(Args{}...);
+}
+
+struct Forwarder {
+    const char* name;
+    size_t entry;  // offset of the function's entry in the list
+    CK_RV (*call)(IVokPkcs11*);
+};
+#define VOK_FORWARDER(name, params)           \
+    {#name, offsetof(CK_FUNCTION_LIST, name), \
+     [](IVokPkcs11* t) { return callWithZeros(t, &IVokPkcs11::name); }},
+const Forwarder kForwarders[] = {VOK_CK_FUNCTIONS(VOK_FORWARDER)};
+
+TEST_F(NativeInterfaceTest, AFunctionTheListLeavesNullIsNotSupported) {
+    std::vector<CK_FUNCTION_LIST> lists(std::size(kForwarders), *fake_vendor_function_list());
+    for (size_t i = 0; i < lists.size(); ++i) {
+        const Forwarder& f = kForwarders[i];
+        SCOPED_TRACE(f.name);
+        std::memset(reinterpret_cast<char*>(&lists[i]) + f.entry, 0, sizeof(void*));
+        const std::string name = std::string("gap-") + f.name;
+        voktest::registerModule(name.c_str(), &lists[i]);
+        EXPECT_EQ(f.call(instance(name.c_str()).get()), CKR_FUNCTION_NOT_SUPPORTED);
+        EXPECT_EQ(fake_vendor_call_count(), 0u);
+    }
 }
 
 }  // namespace

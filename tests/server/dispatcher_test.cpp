@@ -2,14 +2,26 @@
 // Java VM), and what it makes of requests no proxy would send.
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <malloc.h>
 
+#include <atomic>
+#include <cstddef>
 #include <cstdint>
 #include <cstdlib>
+#include <cstring>
+#include <fstream>
+#include <map>
 #include <memory>
 #include <ostream>
 #include <random>
 #include <string>
+#include <thread>
 #include <vector>
+
+#if defined(__SANITIZE_ADDRESS__)
+// The sanitizer runtime's count (its header does not come with every compiler).
+extern "C" size_t __sanitizer_get_current_allocated_bytes();
+#endif
 
 #include "jvm_fixture.h"
 #include "log_capture.h"
@@ -206,6 +218,7 @@ TEST_F(Dispatcher, ACommandSeesNothingOfThePreviousOne) {
 constexpr uint64_t kHuge = uint64_t{1} << 62;
 constexpr uint64_t kAll = ~uint64_t{0};
 constexpr uint64_t kOverHalfAFrame = (uint64_t{3} << 29);  // 1.5 GiB, each fits, both do not
+constexpr uint64_t kBeyondAllowance = (uint64_t{16} << 20) + 4096;
 
 struct Oversized {
     const char* label;
@@ -287,6 +300,25 @@ const Oversized kOversized[] = {
     {"RandomLength", "C_GenerateRandom",
      [](auto& op) { op.mutable_generaterandom()->set_ulrandomlen(kHuge); }},
     {"SeedLength", "C_SeedRandom", [](auto& op) { op.mutable_seedrandom()->set_ulseedlen(kAll); }},
+    // Each within a frame, but beyond what a request this small may make the
+    // service allocate.
+    {"RandomWithinAFrame", "C_GenerateRandom",
+     [](auto& op) {
+         op.mutable_generaterandom()->set_randomdata("");
+         op.mutable_generaterandom()->set_ulrandomlen(INT32_MAX);
+     }},
+    {"CapacityBeyondTheAllowance", "C_Decrypt",
+     [](auto& op) {
+         op.mutable_dec()->set_pdata("");
+         op.mutable_dec()->set_puldatalen(kBeyondAllowance);
+     }},
+    {"HandlesBeyondTheAllowance", "C_FindObjects",
+     [](auto& op) { op.mutable_findobj()->set_ulmaxobjectcount(kBeyondAllowance / 8); }},
+    {"ValueBeyondTheAllowance", "C_GetAttributeValue",
+     [](auto& op) {
+         value(op.mutable_attvalue()->add_attribute(), kBeyondAllowance);
+         op.mutable_attvalue()->set_ulcount(1);
+     }},
 };
 
 void PrintTo(const Oversized& o, std::ostream* os) { *os << o.label; }
@@ -357,3 +389,112 @@ TEST_F(Dispatcher, TruncatedAndRandomRequestsAreSurvived) {
 }
 
 }  // namespace
+
+// ---- Modules and requests that used to crash or bloat the service ----------------
+
+#define VOK_ENTRY_OFFSET(name, params) {#name, offsetof(CK_FUNCTION_LIST, name)},
+const std::map<std::string, size_t> kEntryOffsets = {VOK_CK_FUNCTIONS(VOK_ENTRY_OFFSET)};
+
+// The list's entry behind a command: three commands are spelt their own way.
+size_t entryOf(std::string command) {
+    const std::map<std::string, std::string> spelt = {
+        {"C_InitPin", "C_InitPIN"}, {"C_SetPin", "C_SetPIN"}, {"C_UnWrapKey", "C_UnwrapKey"}};
+    if (spelt.count(command)) command = spelt.at(command);
+    return kEntryOffsets.at(command);
+}
+
+TEST_F(Dispatcher, AFunctionTheListLeavesNullIsNotSupported) {
+    const std::vector<Route> all = routes();
+    // One list per module, alive as long as the registry may look at it.
+    std::vector<CK_FUNCTION_LIST> lists(all.size(), *fake_vendor_function_list());
+    for (size_t i = 0; i < all.size(); ++i) {
+        const Route& r = all[i];
+        if (!r.answeredAs || r.sent.size() != strlen(r.sent.c_str())) continue;
+        SCOPED_TRACE(r.sent);
+        std::memset(reinterpret_cast<char*>(&lists[i]) + entryOf(r.sent), 0, sizeof(void*));
+        voktest::registerModule(r.sent.c_str(), &lists[i]);
+        setModuleName_Server(r.sent.c_str());
+        fake_vendor_clear_calls();
+        const pkcs11::OperationResult res = parsed(dispatch(requestBytes(r.sent)));
+        EXPECT_EQ(r.answeredAs, res.name());
+        EXPECT_EQ(CKR_FUNCTION_NOT_SUPPORTED, res.result());
+        EXPECT_EQ(0u, fake_vendor_call_count());
+    }
+}
+
+// Under the address sanitizer a reader of a freed name is reported.
+TEST_F(Dispatcher, ANameReplacedWhileCommandsAreServedIsNeverReadFreed) {
+    voktest::registerModule("vok-other-name", fake_vendor_function_list());
+    std::atomic<bool> done{false};
+    std::thread renamer([&] {
+        for (int i = 0; !done; ++i) setModuleName_Server(i % 2 ? kModuleName : "vok-other-name");
+    });
+    for (int i = 0; i < 2000; ++i)
+        EXPECT_EQ("C_GetInfo", parsed(dispatch(requestBytes("C_GetInfo"))).name());
+    done = true;
+    renamer.join();
+}
+
+TEST_F(Dispatcher, ANameThatCouldNotBeCopiedServesNoModule) {
+    gModuleNameCopy = [](const char*) -> char* { return nullptr; };
+    setModuleName_Server("vok-next-name");
+    gModuleNameCopy = strdup;
+    EXPECT_EQ("", dispatch(requestBytes("C_GetInfo")));
+    EXPECT_EQ(0u, fake_vendor_call_count());
+    setModuleName_Server(kModuleName);
+    EXPECT_EQ("C_GetInfo", parsed(dispatch(requestBytes("C_GetInfo"))).name());
+}
+
+size_t allocatedBytes() {
+#if defined(__SANITIZE_ADDRESS__)
+    return __sanitizer_get_current_allocated_bytes();
+#else
+    return mallinfo2().uordblks + mallinfo2().hblkhd;
+#endif
+}
+
+// The process's peak resident memory since the last reset, in bytes.
+size_t peakResident(bool reset = false) {
+    if (reset) std::ofstream("/proc/self/clear_refs") << "5";
+    std::ifstream status("/proc/self/status");
+    for (std::string line; std::getline(status, line);)
+        if (line.rfind("VmHWM:", 0) == 0) return std::stoul(line.substr(6)) * 1024;
+    return 0;
+}
+
+// A C_CreateObject request with `count` empty template entries, written by
+// hand: building it as messages would take the memory the test watches.
+std::string emptyAttributes(size_t count) {
+    const std::string entries = [&] {
+        std::string bytes;
+        for (size_t i = 0; i < count; ++i) bytes.append("\x12\x00", 2);  // pTemplate, empty
+        return bytes;
+    }();
+    std::string request = requestBytes(
+        "C_CreateObject", [&](auto& op) { op.mutable_createobject()->set_ulcount(count); });
+    // A second occurrence of the sub-message (field 36) is merged into the first.
+    request += "\xa2\x02";
+    uint64_t length = entries.size();
+    for (; length >= 0x80; length >>= 7) request += static_cast<char>(length | 0x80);
+    request += static_cast<char>(length);
+    return request + entries;
+}
+
+TEST_F(Dispatcher, NothingOfARequestStaysAllocatedAfterItsAnswer) {
+    const std::string request = emptyAttributes(10000);
+    dispatch(requestBytes("C_GetInfo"));
+    fake_vendor_reset();  // what the module keeps (records, objects) is not the service's
+    const size_t before = allocatedBytes();
+    EXPECT_EQ("C_CreateObject", parsed(dispatch(request)).name());
+    fake_vendor_reset();
+    EXPECT_LT(allocatedBytes(), before + 16 * 1024);
+}
+
+// The documented bound: about 16 times the request's size plus 70 MiB.
+TEST_F(Dispatcher, ARequestBuiltToBloatItsParseIsRefusedWithinTheBound) {
+    const std::string request = emptyAttributes(4 << 20);
+    const size_t start = peakResident(true);
+    EXPECT_EQ("", dispatch(request));
+    EXPECT_EQ(0u, fake_vendor_call_count());
+    EXPECT_LT(peakResident() - start, 16 * request.size() + (70u << 20));
+}

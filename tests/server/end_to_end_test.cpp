@@ -1,16 +1,21 @@
 // The exported C_ proxies through the real socket to this server, which calls
 // the fake module registered under its server id, all in one process.
+#include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <cstdio>
 #include <cstring>
+#include <fstream>
 #include <functional>
 #include <sstream>
 #include <string>
 #include <vector>
 
 #include "jvm_fixture.h"
+#include "raw_peer.h"
 #include "server_test_support.h"
 #include "vok_client.h"
 
@@ -410,6 +415,113 @@ TEST_F(EndToEnd, NullBuffersTemplatesAndMechanismsReachTheModuleAsNull) {
     CK_MECHANISM noParameter{CKM_AES_CBC, nullptr, 16};
     EXPECT_NE(kNoAnswer, C_EncryptInit(s, &noParameter, 1));
     EXPECT_TRUE(fakevendor::lastCall("C_EncryptInit").arg("pMechanism").items.at(0).null);
+}
+
+// ---- PINs ----------------------------------------------------------------------
+
+// A PIN made at run time, so that no constant in the program holds it.
+class Secret {
+public:
+    static constexpr size_t kSize = 24;
+    uint8_t at(size_t i) const { return static_cast<uint8_t>(seed_ ^ (i * 29 + 11)); }
+    // Writes it over every run of kSize 'P' bytes.
+    void writeOver(std::string& bytes) const {
+        for (size_t p = bytes.find(std::string(kSize, 'P')); p != std::string::npos;
+             p = bytes.find(std::string(kSize, 'P'), p))
+            for (size_t i = 0; i < kSize; ++i) bytes[p + i] = static_cast<char>(at(i));
+    }
+    // Copies of it anywhere in the writable memory of this process.
+    size_t copiesInMemory() const {
+        const int mem = open("/proc/self/mem", O_RDONLY);
+        std::vector<uint8_t> chunk(1 << 20);
+        std::ifstream maps("/proc/self/maps");
+        size_t found = 0;
+        for (std::string line; std::getline(maps, line);) {
+            unsigned long long start = 0, end = 0;
+            char perms[5] = {};
+            if (sscanf(line.c_str(), "%llx-%llx %4s", &start, &end, perms) != 3) continue;
+            // Not the sanitizer's shadow: huge and never holding data.
+            if (perms[0] != 'r' || perms[1] != 'w' || end - start > (1ull << 30)) continue;
+            for (unsigned long long at = start; at < end; at += chunk.size() - kSize) {
+                const ssize_t n =
+                    pread(mem, chunk.data(), std::min<unsigned long long>(chunk.size(), end - at),
+                          static_cast<off_t>(at));
+                for (ssize_t i = 0; i + static_cast<ssize_t>(kSize) <= n; ++i) {
+                    size_t k = 0;
+                    while (k < kSize && chunk[i + k] == this->at(k)) ++k;
+                    found += k == kSize;
+                }
+                if (n <= 0 || at + n >= end) break;
+            }
+        }
+        close(mem);
+        return found;
+    }
+
+private:
+    const uint8_t seed_ = static_cast<uint8_t>(getpid() | 0x80);
+};
+
+// Functions that take a PIN and look at nothing: the fake module records what
+// it receives, copies that are not the service's.
+CK_FUNCTION_LIST pinRefusingModule() {
+    CK_FUNCTION_LIST list = *fake_vendor_function_list();
+    list.C_Login = [](CK_SESSION_HANDLE, CK_USER_TYPE, CK_UTF8CHAR_PTR, CK_ULONG) -> CK_RV {
+        return CKR_PIN_INCORRECT;
+    };
+    list.C_InitToken = [](CK_SLOT_ID, CK_UTF8CHAR_PTR, CK_ULONG, CK_UTF8CHAR_PTR) -> CK_RV {
+        return CKR_PIN_INCORRECT;
+    };
+    list.C_InitPIN = [](CK_SESSION_HANDLE, CK_UTF8CHAR_PTR, CK_ULONG) -> CK_RV {
+        return CKR_PIN_INCORRECT;
+    };
+    list.C_SetPIN = [](CK_SESSION_HANDLE, CK_UTF8CHAR_PTR, CK_ULONG, CK_UTF8CHAR_PTR,
+                       CK_ULONG) -> CK_RV { return CKR_PIN_INCORRECT; };
+    return list;
+}
+
+using servertest::parsed;
+using servertest::requestBytes;
+
+class PinWipe : public voktest::JvmTest {};
+
+// The channel's payload, the dispatcher's copy, both parses and the
+// module's buffer: each is wiped before it is released.
+TEST_F(PinWipe, NoCopyOfAPinOutlivesItsRequest) {
+    static CK_FUNCTION_LIST module = pinRefusingModule();
+    const std::string id = voktest::uniqueServerId();
+    voktest::registerModule(id.c_str(), &module);
+    ASSERT_EQ(0, vokpkcs11_init_server(id.c_str()));
+    voktest::RawSocket client = voktest::rawConnect(id);
+    voktest::WireHeader header;
+    voktest::Bytes answer;
+    ASSERT_TRUE(client.sendFrame({100, 103, 0, 4}, voktest::int32Bytes(1)));
+    ASSERT_TRUE(client.recvFrame(&header, &answer));
+
+    const Secret secret;
+    const std::string pin(Secret::kSize, 'P');
+    const std::vector<std::string> requests = {
+        requestBytes("C_Login", [&](auto& op) { op.mutable_login()->set_ppin(pin); }),
+        requestBytes("C_InitToken", [&](auto& op) { op.mutable_inittoken()->set_ppin(pin); }),
+        requestBytes("C_InitPin", [&](auto& op) { op.mutable_initpin()->set_ppin(pin); }),
+        requestBytes("C_SetPin",
+                     [&](auto& op) {
+                         op.mutable_setpin()->set_poldpin(pin),
+                             op.mutable_setpin()->set_pnewpin(pin);
+                     }),
+    };
+    for (std::string request : requests) {
+        voktest::Bytes frame =
+            voktest::encodeHeader({101, 103, 0, static_cast<int32_t>(request.size())});
+        secret.writeOver(request);
+        frame.insert(frame.end(), request.begin(), request.end());
+        std::fill(request.begin(), request.end(), 0);
+        ASSERT_TRUE(client.sendBytes(frame));
+        std::fill(frame.begin(), frame.end(), 0);
+        ASSERT_TRUE(client.recvFrame(&header, &answer));
+        EXPECT_EQ(CKR_PIN_INCORRECT, parsed(std::string(answer.begin(), answer.end())).result());
+    }
+    EXPECT_EQ(0u, secret.copiesInMemory());
 }
 
 }  // namespace

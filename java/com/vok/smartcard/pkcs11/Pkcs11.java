@@ -126,6 +126,19 @@ public class Pkcs11 {
             throws IOException, PKCS11Exception;
 
     /**
+     * Restricts which local processes the service serves, by their user id. The service's
+     * socket is open to every process of the device; once a list is set, a client whose user
+     * id is not on it is disconnected right after it connects, and the refusal is logged.
+     * Without a list, which is how a process starts, every client is served. Call it in the
+     * service process before {@link #connect}; later calls take effect from the next client
+     * that connects.
+     *
+     * @param uids the user ids to serve (an empty array serves nobody), or null to serve
+     *     every client again
+     */
+    public static native void setAllowedPeerUids(int[] uids);
+
+    /**
      * Unties this object from its module and unloads the module's library.
      *
      * <p>It then closes the process's channel to the service, whichever object opened it and

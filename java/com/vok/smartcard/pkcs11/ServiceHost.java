@@ -12,14 +12,16 @@ import java.util.Arrays;
  * A service process in its simplest form: it connects one vendor module in the server role and
  * serves clients under a server id until it is stopped.
  *
- * <p>Usage: {@code ServiceHost [--no-stdin] <serverId> <moduleLibrary> [<functionListName>]}.
+ * <p>Usage: {@code ServiceHost [--no-stdin] [--allow-uids <uid>,...] <serverId> <moduleLibrary>
+ * [<functionListName>]}.
  * Once the module is connected it prints {@code serving <serverId>} on standard output. It stops
  * when its standard input ends or when it is terminated (SIGTERM); it then disconnects the
  * module and prints {@code stopped <serverId>}. Each input line {@code usage} is answered with
  * {@code usage <time>}, the value of
  * {@link SandboxedProcessUsageStatistics#native_getLastUsageTime()}. With {@code --no-stdin}
  * it leaves standard input alone and runs until it is terminated, for starting it in the
- * background.
+ * background. With {@code --allow-uids} it serves only clients running under one of the given
+ * user ids (see {@link Pkcs11#setAllowedPeerUids}).
  *
  * <p>Exit status: 0 when its input ended, 143 when terminated, 1 when the module cannot be
  * connected, 2 for bad arguments.
@@ -89,10 +91,18 @@ public final class ServiceHost {
         if (!readInput) {
             args = Arrays.copyOfRange(args, 1, args.length);
         }
+        int[] allowedUids = null;
+        if (args.length > 1 && args[0].equals("--allow-uids")) {
+            allowedUids = parseUids(args[1]);
+            args = Arrays.copyOfRange(args, 2, args.length);
+        }
         if (args.length < 2 || args.length > 3) {
-            System.err.println("usage: ServiceHost [--no-stdin] <serverId> <moduleLibrary>"
-                    + " [<functionListName>]");
+            System.err.println("usage: ServiceHost [--no-stdin] [--allow-uids <uid>,...]"
+                + " <serverId> <moduleLibrary> [<functionListName>]");
             System.exit(2);
+        }
+        if (allowedUids != null) {
+            Pkcs11.setAllowedPeerUids(allowedUids);
         }
         String getter = args.length > 2 ? args[2] : Pkcs11.DEFAULT_FUNCTION_LIST_NAME;
         final ServiceHost host = new ServiceHost(args[0], args[1], getter);
@@ -121,6 +131,20 @@ public final class ServiceHost {
             System.err.println("standard input failed: " + e.getMessage());
         }
         System.exit(0);
+    }
+
+    private static int[] parseUids(String list) {
+        String[] parts = list.split(",");
+        int[] uids = new int[parts.length];
+        try {
+            for (int i = 0; i < uids.length; i++) {
+                uids[i] = Integer.parseInt(parts[i].trim());
+            }
+        } catch (NumberFormatException e) {
+            System.err.println("not a list of user ids: " + list);
+            System.exit(2);
+        }
+        return uids;
     }
 
     private static void waitForTermination() {
