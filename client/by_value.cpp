@@ -63,8 +63,9 @@ void copyBackStructure(const Layout& l, void* s, const pkcs11::CK_STRUCTURE& ans
             copyBackStructure(*m.pointee, p, entry.structure(), &l, s);
         else if (m.kind == Kind::kBuffer && entry.has_data())
             memcpy(p, entry.data().data(),
-                   std::min<size_t>(layout::bufferLength(l, m, s, parentLayout, parent),
-                                    entry.data().size()));
+                   static_cast<size_t>(
+                       std::min<CK_ULONG>(layout::bufferLength(l, m, s, parentLayout, parent),
+                                          entry.data().size())));
     }
 }
 

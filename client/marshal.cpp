@@ -1,9 +1,11 @@
 #include "marshal.h"
 
 #include <algorithm>
+#include <cstdint>
+#include <cstring>
+#include <stdexcept>
 
 #include "by_value.h"
-#include <cstring>
 
 #define LOG_TAG "Vokpkcs11f"
 #include "vok_log.h"
@@ -23,11 +25,17 @@ size_t boundedCopy(CK_ULONG stated, size_t arrived, CK_ULONG capacity) {
 std::string cString(const void* p, CK_ULONG limit) {
     if (!p) return std::string();
     const char* s = static_cast<const char*>(p);
-    return std::string(s, strnlen(s, static_cast<size_t>(limit)));
+    // A limit beyond this process's address space limits nothing: cut to the
+    // width of size_t it would read less than the caller gave.
+    return std::string(s, strnlen(s, static_cast<size_t>(std::min<CK_ULONG>(limit, SIZE_MAX))));
 }
 
 std::string bytesOf(const void* p, CK_ULONG length) {
     if (!p || length == 0) return std::string();
+    // No frame carries more (its length is a signed 32-bit number): the call
+    // fails as an unsendable one, before a byte is read, and no width of
+    // size_t cuts the length into a short copy.
+    if (length > static_cast<CK_ULONG>(INT32_MAX)) throw std::length_error("beyond a frame");
     return std::string(static_cast<const char*>(p), static_cast<size_t>(length));
 }
 

@@ -27,7 +27,8 @@ inline CK_ULONG valueOr0(const CK_ULONG* p) { return p ? *p : 0; }
 // `limit`. NULL gives an empty string (callers leave the field absent).
 std::string cString(const void* p, CK_ULONG limit);
 
-// Input (pointer, length) pair: exactly `length` bytes.
+// Input (pointer, length) pair: exactly `length` bytes. A length no frame can
+// carry throws std::length_error, which fails the call like a broken channel.
 std::string bytesOf(const void* p, CK_ULONG length);
 
 // Input-buffer rule: exactly `length` bytes. A NULL pointer with a length

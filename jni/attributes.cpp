@@ -106,7 +106,8 @@ void throwUnconvertible(JNIEnv* env, jobject object) {
 std::string boundedText(const CK_BYTE* bytes, CK_ULONG length) {
     if (bytes == nullptr) return std::string();
     const auto* text = reinterpret_cast<const char*>(bytes);
-    return std::string(text, strnlen(text, length));
+    return std::string(text,
+                       strnlen(text, static_cast<size_t>(std::min<CK_ULONG>(length, SIZE_MAX))));
 }
 
 // Converts a non-null value by the first class it is an instance of. Call

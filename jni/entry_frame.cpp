@@ -1,6 +1,8 @@
 #define LOG_TAG "[native jni pkcs11wrapper]"
 #include "entry_frame.h"
 
+#include <algorithm>
+#include <cstdint>
 #include <cstring>
 
 #include "java_objects.h"
@@ -40,7 +42,9 @@ bool allocateOutput(JNIEnv* env, CK_ULONG capacity, std::size_t elementSize, voi
 std::string boundedText(const void* bytes, CK_ULONG length) {
     if (bytes == nullptr) return std::string();
     const auto* text = static_cast<const char*>(bytes);
-    return std::string(text, strnlen(text, static_cast<std::size_t>(length)));
+    // A length beyond the address space limits nothing (cut, it would stop short).
+    return std::string(
+        text, strnlen(text, static_cast<std::size_t>(std::min<CK_ULONG>(length, SIZE_MAX))));
 }
 
 }  // namespace vokjni

@@ -55,6 +55,10 @@ struct WipingFree {
     }
 };
 
+// Every size below fits size_t on the 32-bit targets too, so no cast to it
+// cuts a length.
+static_assert(kFrameLimit <= SIZE_MAX && kMaxElements <= SIZE_MAX, "sizes fit size_t");
+
 // `count` zero-filled elements from malloc. Never NULL, even for 0: the module
 // always receives a real pointer. A count beyond a frame's worth of bytes,
 // beyond what is left of the request's buffer allowance, or memory that is not

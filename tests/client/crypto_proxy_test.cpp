@@ -185,6 +185,22 @@ TEST_F(OutputBuffers, UnterminatedBufferIsReadWithinItsLength) {
     }
 }
 
+// On every pointer width: a capacity above 4 GiB limits nothing this side of
+// the buffer's zero byte (cut to a 32-bit size_t it would stop at byte 1).
+constexpr CK_ULONG kAbove4GiB = (CK_ULONG{1} << 32) + 1;
+
+TEST_F(OutputBuffers, CapacityAboveFourGiBIsReadUpToTheZeroByte) {
+    for (const OutputProxy& proxy : kOutputProxies) {
+        SCOPED_TRACE(proxy.name);
+        std::vector<CK_BYTE> out = buffer(16);
+        memcpy(out.data(), "abc", 4);
+        CK_ULONG length = kAbove4GiB;
+        proxy.call(out.data(), &length);
+        EXPECT_EQ("abc", sent(proxy).bytes);
+        EXPECT_EQ(kAbove4GiB, sent(proxy).capacity);
+    }
+}
+
 class CryptoProxies : public ::testing::Test {
 protected:
     TestService& service = TestService::start();
@@ -248,6 +264,51 @@ TEST_F(CryptoProxies, EchoedBytesStayWithinTheCallersBuffer) {
             EXPECT_EQ((c.heedsStatedLength ? a.asStated : a.whole) + "\xa5\xa5",
                       std::string(buffer.begin(), buffer.end()));
         }
+    }
+}
+
+// An input length above 4 GiB, which no frame carries, fails the call before
+// a byte is read or sent, whichever rule the input follows; a PIN's length
+// only limits how far it is read.
+TEST_F(CryptoProxies, InputLengthsAboveFourGiB) {
+    static CK_BYTE in[] = {'a', 'b', 0, 'd'};
+    static CK_RSA_PKCS_OAEP_PARAMS oaep{CKM_SHA256, CKG_MGF1_SHA256, CKZ_DATA_SPECIFIED, in,
+                                        kAbove4GiB};
+    static CK_ATTRIBUTE label{CKA_LABEL, in, kAbove4GiB};
+    static CK_BYTE out[4];
+    static CK_ULONG outLength, handle;
+    const struct {
+        const char* rule;
+        CK_RV (*call)();
+        const char* pinSent;  // nullptr: refused, nothing sent
+    } cases[] = {
+        {"data", [] { return C_Encrypt(kSession, in, kAbove4GiB, out, &outLength); }, nullptr},
+        {"template value", [] { return C_CreateObject(kSession, &label, 1, &handle); }, nullptr},
+        {"mechanism parameter",
+         [] {
+             CK_MECHANISM m{CKM_SHA256, in, kAbove4GiB};
+             return C_DigestInit(kSession, &m);
+         },
+         nullptr},
+        {"member by value",
+         [] {
+             CK_MECHANISM m{CKM_RSA_PKCS_OAEP, &oaep, sizeof oaep};
+             return C_EncryptInit(kSession, &m, kKey);
+         },
+         nullptr},
+        {"PIN", [] { return C_Login(kSession, CKU_USER, in, kAbove4GiB); }, "ab"},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.rule);
+        const size_t requests = service.requestCount();
+        const CK_RV rv = c.call();
+        if (!c.pinSent) {
+            EXPECT_EQ(kAllOnes, rv);
+            EXPECT_EQ(requests, service.requestCount());
+            continue;
+        }
+        EXPECT_EQ(c.pinSent, service.lastRequest().login().ppin());
+        EXPECT_EQ(kAbove4GiB, service.lastRequest().login().ulpinlen());
     }
 }
 

@@ -6,6 +6,7 @@
 // every proxy through the same situation iterate over this table.
 
 #include <string>
+#include <type_traits>
 #include <vector>
 
 #include "vok_pkcs11.h"
@@ -33,8 +34,9 @@ struct Field {
     std::vector<std::string> repeatedMessages;
 
     Field() = default;
-    Field(uint64_t n) : kind(kNumber), number(n) {}
-    Field(int n) : kind(kNumber), number(static_cast<uint64_t>(n)) {}
+    // Any integer: the constants' types differ between pointer widths.
+    template <class N, std::enable_if_t<std::is_integral<N>::value, int> = 0>
+    Field(N n) : kind(kNumber), number(static_cast<uint64_t>(n)) {}
     Field(std::string b) : kind(kBytes), bytes(std::move(b)) {}
     Field(const char* b) : kind(kBytes), bytes(b) {}
     static Field message(const std::vector<Field>& fields);

@@ -250,7 +250,8 @@ const std::vector<std::string> kGcmLines = {
 const Frame kFrames[] = {
     {"GcmRaw", [](auto& op) { encryptInit(op, CKM_AES_GCM, sizeof kGcm); }, kParam, {}},
     {"GcmByValue", [](auto& op) { gcm(op, sizeof kGcm); }, 0, kGcmLines},
-    {"GcmOfA32BitClient", [](auto& op) { gcm(op, 40); }, 0, kGcmLines},
+    // A 32-bit client's raw bytes at a 64-bit service, or the other way round.
+    {"GcmOfTheOtherWidth", [](auto& op) { gcm(op, sizeof(void*) == 8 ? 40 : 48); }, 0, kGcmLines},
     {"GcmShortOfANumber", [](auto& op) { gcm(op, sizeof kGcm, 3); }, kParam, {}},
     {"VendorMechanism", [](auto& op) { encryptInit(op, CKM_VENDOR_DEFINED | 7, 16); }, kParam, {}},
     {"PointersWithoutForm", [](auto& op) { encryptInit(op, CKM_TLS_PRF, 48); }, kParam, {}},

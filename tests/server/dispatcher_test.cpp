@@ -215,7 +215,9 @@ TEST_F(Dispatcher, ACommandSeesNothingOfThePreviousOne) {
 
 // ---- Requests no proxy would send --------------------------------------------------
 
-constexpr uint64_t kHuge = uint64_t{1} << 62;
+// Its low word is a small, servable length: a 32-bit service that cut it to
+// size_t would serve it.
+constexpr uint64_t kHuge = (uint64_t{1} << 62) + 16;
 constexpr uint64_t kAll = ~uint64_t{0};
 constexpr uint64_t kOverHalfAFrame = (uint64_t{3} << 29);  // 1.5 GiB, each fits, both do not
 constexpr uint64_t kBeyondAllowance = (uint64_t{16} << 20) + 4096;

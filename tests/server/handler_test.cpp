@@ -338,14 +338,14 @@ void overReportSlots(CK_FUNCTION_LIST& l) {
 }
 void overReportFound(CK_FUNCTION_LIST& l) {
     l.C_FindObjects = [](CK_SESSION_HANDLE, CK_OBJECT_HANDLE_PTR handles, CK_ULONG max,
-                         CK_ULONG_PTR found) {
+                         CK_ULONG_PTR found) -> CK_RV {
         for (CK_ULONG i = 0; i < max; ++i) handles[i] = 7;
         *found = max + 1;
         return CKR_OK;
     };
 }
 void overReportState(CK_FUNCTION_LIST& l) {
-    l.C_GetOperationState = [](CK_SESSION_HANDLE, CK_BYTE_PTR state, CK_ULONG_PTR length) {
+    l.C_GetOperationState = [](CK_SESSION_HANDLE, CK_BYTE_PTR state, CK_ULONG_PTR length) -> CK_RV {
         memset(state, 'S', *length);
         *length = 1000;
         return CKR_OK;
@@ -353,7 +353,7 @@ void overReportState(CK_FUNCTION_LIST& l) {
 }
 void overReportValue(CK_FUNCTION_LIST& l) {
     l.C_GetAttributeValue = [](CK_SESSION_HANDLE, CK_OBJECT_HANDLE, CK_ATTRIBUTE_PTR t,
-                               CK_ULONG n) {
+                               CK_ULONG n) -> CK_RV {
         for (CK_ULONG i = 0; i < n; ++i)
             memset(t[i].pValue, 'v', t[i].ulValueLen), t[i].ulValueLen = 100;
         return CKR_OK;
@@ -559,7 +559,7 @@ TEST_F(PreparedToken, FoundHandlesComeBackUpToTheMaximum) {
 // A module that fills every byte: each text runs on, but not past the end.
 TEST_F(PreparedToken, RunOnTextStopsAtTheEndOfTheStructure) {
     CK_FUNCTION_LIST patched = *module_;
-    patched.C_GetTokenInfo = [](CK_SLOT_ID, CK_TOKEN_INFO_PTR info) {
+    patched.C_GetTokenInfo = [](CK_SLOT_ID, CK_TOKEN_INFO_PTR info) -> CK_RV {
         memset(info, 'A', sizeof *info);
         return CKR_OK;
     };

@@ -1,5 +1,6 @@
-// The 64-bit host's literal sizes and the function list's slot order: a
-// slot out of place calls the wrong vendor function, which no size check sees.
+// The literal sizes of both pointer widths, and the function list's slot
+// order: a slot out of place calls the wrong vendor function, which no size
+// check sees. The same test runs on the 64-bit host and the 32-bit targets.
 #include <gtest/gtest.h>
 
 #include <cstddef>
@@ -8,22 +9,33 @@
 
 namespace {
 
-constexpr size_t slot(size_t index) { return 2 + index * 8; }
+constexpr size_t slot(size_t index) { return 2 + index * sizeof(void*); }
 
-TEST(layout64, LiteralSizes) {
-    ASSERT_EQ(sizeof(void*), 8u);
-    EXPECT_EQ(sizeof(CK_INFO), 76u);
-    EXPECT_EQ(offsetof(CK_INFO, flags), 34u);
-    EXPECT_EQ(sizeof(CK_ATTRIBUTE), 24u);
-    EXPECT_EQ(sizeof(CK_MECHANISM), 24u);
-    EXPECT_EQ(sizeof(CK_FUNCTION_LIST), 546u);
-    EXPECT_EQ(sizeof(CK_RSA_PKCS_OAEP_PARAMS), 40u);
-    EXPECT_EQ(sizeof(CK_KEA_DERIVE_PARAMS), 41u);
-    EXPECT_EQ(sizeof(CK_PKCS5_PBKD2_PARAMS), 72u);
-    EXPECT_EQ(sizeof(CK_SSL3_KEY_MAT_PARAMS), 65u);
+TEST(layout, LiteralSizes) {
+    ASSERT_TRUE(sizeof(void*) == 4 || sizeof(void*) == 8);
+    struct Size {
+        const char* name;
+        size_t actual, at32, at64;
+    };
+    const Size sizes[] = {
+        {"CK_INFO", sizeof(CK_INFO), 76, 76},
+        {"CK_INFO.flags", offsetof(CK_INFO, flags), 34, 34},
+        {"CK_ATTRIBUTE", sizeof(CK_ATTRIBUTE), 20, 24},
+        {"CK_ATTRIBUTE.ulValueLen", offsetof(CK_ATTRIBUTE, ulValueLen), 12, 16},
+        {"CK_MECHANISM", sizeof(CK_MECHANISM), 20, 24},
+        {"CK_C_INITIALIZE_ARGS", sizeof(CK_C_INITIALIZE_ARGS), 28, 48},
+        {"CK_FUNCTION_LIST", sizeof(CK_FUNCTION_LIST), 274, 546},
+        {"CK_RSA_PKCS_OAEP_PARAMS", sizeof(CK_RSA_PKCS_OAEP_PARAMS), 36, 40},
+        {"CK_KEA_DERIVE_PARAMS", sizeof(CK_KEA_DERIVE_PARAMS), 29, 41},
+        {"CK_PKCS5_PBKD2_PARAMS", sizeof(CK_PKCS5_PBKD2_PARAMS), 56, 72},
+        {"CK_SSL3_KEY_MAT_PARAMS", sizeof(CK_SSL3_KEY_MAT_PARAMS), 53, 65},
+        {"CK_GCM_PARAMS", sizeof(CK_GCM_PARAMS), 40, 48},
+    };
+    for (const Size& s : sizes)
+        EXPECT_EQ(s.actual, sizeof(void*) == 4 ? s.at32 : s.at64) << s.name;
 }
 
-TEST(layout64, FunctionListSlotOrder) {
+TEST(layout, FunctionListSlotOrder) {
     struct Slot {
         const char* name;
         size_t offset;
