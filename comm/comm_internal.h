@@ -62,11 +62,15 @@ FrameSend sendFrame(int fd, const FrameHeader& header, const void* payload, size
 class ReceiveStage {
 public:
     explicit ReceiveStage(size_t capacity) : capacity_(capacity) {}
+    ~ReceiveStage() { discard(); }
+    ReceiveStage(const ReceiveStage&) = delete;
+    ReceiveStage& operator=(const ReceiveStage&) = delete;
     // Reads exactly `length` bytes. Returns 1 once they are in, else the
     // result (0 or -1) of the recv that failed.
     ssize_t read(int fd, void* buffer, size_t length, CallReport report);
     size_t staged() const { return end_ - begin_; }
-    void discard() { begin_ = end_ = 0; }
+    // Staged bytes are wiped once read or dropped: requests carry PINs.
+    void discard();
 
 private:
     size_t capacity_;

@@ -49,6 +49,15 @@ FrameSend sendFrame(int fd, const FrameHeader& header, const void* payload, size
     return result;
 }
 
+namespace {
+void* (*const volatile wipeWith)(void*, int, size_t) = std::memset;
+}
+
+void ReceiveStage::discard() {
+    if (bytes_ && end_ > 0) wipeWith(bytes_.get(), 0, end_);
+    begin_ = end_ = 0;
+}
+
 ssize_t ReceiveStage::read(int fd, void* buffer, size_t length, CallReport report) {
     if (!bytes_ && capacity_ > 0) {
         bytes_.reset(new (std::nothrow) uint8_t[capacity_]);

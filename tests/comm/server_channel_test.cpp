@@ -595,6 +595,7 @@ TEST_F(ServerChannelTest, APayloadIsAllocatedOnlyAsItArrives) {
     RawSocket& client = start();
     const uint64_t before = addressSpaceInUse();
     ASSERT_TRUE(client.sendHeader(commandHeader(INT32_MAX)));
+    ASSERT_TRUE(waitForLine("Bytes read:16"));  // the header alone, then the first bytes
     ASSERT_TRUE(client.sendBytes(Bytes(1000, 7)));
     ASSERT_TRUE(waitForLine("Bytes read:1000"));
     EXPECT_LT(addressSpaceInUse(), before + (64u << 20));
