@@ -6,24 +6,29 @@
 #include <cstring>
 
 #include "java_objects.h"
+#include "module_holds.h"
 #include "registry.h"
 #include "vok_export.h"
 #include "vok_log.h"
 
 namespace vokjni {
 
-CK_FUNCTION_LIST_PTR connectedModule(JNIEnv* env, jobject thiz, const MethodRules& rules) {
-    ModuleEntry* entry = getModuleEntry(env, thiz);
-    if (env->ExceptionCheck()) return nullptr;
-    if (entry == nullptr) {
+ConnectedModule::ConnectedModule(JNIEnv* env, jobject thiz, const MethodRules& rules)
+    : entry_(holdModuleEntryOf(env, thiz)) {
+    if (env->ExceptionCheck()) return;
+    if (entry_ == nullptr) {
         for (int i = 0; i < rules.missingEntryLines; ++i) VOK_LOGD("failed getting module entry");
         throwDisconnectedRuntimeException(env);
-        return nullptr;
+        return;
     }
     // An entry whose getter failed may have no list: no module to call.
-    if (entry->functionList == nullptr && !rules.listMayBeMissing)
+    if (entry_->functionList == nullptr && !rules.listMayBeMissing)
         throwDisconnectedRuntimeException(env);
-    return entry->functionList;
+    functions_ = entry_->functionList;
+}
+
+ConnectedModule::~ConnectedModule() {
+    if (entry_ != nullptr) releaseModuleEntry(entry_);
 }
 
 void failWithPendingOrOutOfMemory(JNIEnv* env) { throwOutOfMemoryUnlessPending(env); }

@@ -21,6 +21,7 @@
 #include "converters.h"
 #include "exceptions.h"
 #include "vok_pkcs11.h"
+#include "vok_registry.h"
 
 namespace vokjni {
 
@@ -34,10 +35,23 @@ struct MethodRules {
     bool listMayBeMissing = false;    // the body runs (with null) for an entry without a list
 };
 
-// The module registered for `thiz`, or null with an exception pending: the
-// "not connected" PKCS11RuntimeException when there is none (or its list is
-// missing and the rules do not allow that).
-CK_FUNCTION_LIST_PTR connectedModule(JNIEnv* env, jobject thiz, const MethodRules& rules);
+// The module registered for `thiz`, held while this object lives so that a
+// disconnect on another thread does not unload it under the call; or no
+// functions, with an exception pending: the "not connected"
+// PKCS11RuntimeException when there is no module (or its list is missing and
+// the rules do not allow that).
+class ConnectedModule {
+public:
+    ConnectedModule(JNIEnv* env, jobject thiz, const MethodRules& rules);
+    ~ConnectedModule();
+    ConnectedModule(const ConnectedModule&) = delete;
+    ConnectedModule& operator=(const ConnectedModule&) = delete;
+    CK_FUNCTION_LIST_PTR functions() const { return functions_; }
+
+private:
+    ModuleEntry* entry_ = nullptr;
+    CK_FUNCTION_LIST_PTR functions_ = nullptr;
+};
 
 // A C++ exception (only std::bad_alloc can reach here) ends the method with
 // OutOfMemoryError, unless a Java exception is already pending.
@@ -52,10 +66,10 @@ Result nativeMethod(JNIEnv* env, jobject thiz, const char* name, Body&& body,
         __android_log_print(ANDROID_LOG_DEBUG, rules.nameTag, "%s", name);
         if (rules.afterName != nullptr)
             __android_log_print(ANDROID_LOG_DEBUG, kJniTag, "%s", rules.afterName);
-        CK_FUNCTION_LIST_PTR functions = connectedModule(env, thiz, rules);
-        if (functions == nullptr && !rules.listMayBeMissing) return Result();
+        ConnectedModule module(env, thiz, rules);
+        if (module.functions() == nullptr && !rules.listMayBeMissing) return Result();
         if (env->ExceptionCheck()) return Result();
-        return body(functions);
+        return body(module.functions());
     } catch (...) {
         failWithPendingOrOutOfMemory(env);
         return Result();

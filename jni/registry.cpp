@@ -265,7 +265,9 @@ void putModuleEntry(JNIEnv* env, jobject key, ModuleEntry* entry) {
         walk.node->next = node;
 }
 
-ModuleEntry* getModuleEntry(JNIEnv* env, jobject obj) {
+namespace {
+
+ModuleEntry* entryOf(JNIEnv* env, jobject obj, bool hold) {
     if (obj == nullptr || moduleListLock == nullptr) return nullptr;
     ListMonitor monitor(env);
     if (!monitor.held() || moduleListHead == nullptr) return nullptr;
@@ -274,11 +276,18 @@ ModuleEntry* getModuleEntry(JNIEnv* env, jobject obj) {
     if (walk.match == Match::Yes) {
         VOK_LOGD("found the entry");
         VOK_LOGD("module name %s", printable(walk.node->entry->moduleName));
-        return walk.node->entry;
+        ModuleEntry* entry = walk.node->entry;
+        return !hold || holdModuleEntry(entry) ? entry : nullptr;
     }
     VOK_LOGD("the entry is not in the list");
     return nullptr;
 }
+
+}  // namespace
+
+ModuleEntry* getModuleEntry(JNIEnv* env, jobject obj) { return entryOf(env, obj, false); }
+
+ModuleEntry* holdModuleEntryOf(JNIEnv* env, jobject obj) { return entryOf(env, obj, true); }
 
 int isModulePresent(JNIEnv* env, jobject obj) {
     return getModuleEntry(env, obj) != nullptr ? 1 : 0;

@@ -31,6 +31,9 @@ VOK_C_API void JNICALL Java_com_vok_smartcard_pkcs11_Pkcs11_finalizeLibrary(JNIE
 // Lookups by Java object compare by identity (java.lang.Object.equals called
 // non-virtually), whatever the object's class overrides.
 ModuleEntry* getModuleEntry(JNIEnv* env, jobject obj);
+// getModuleEntry with a hold on the entry (see ModuleHold), to be given back
+// with releaseModuleEntry; null also when the hold could not be recorded.
+ModuleEntry* holdModuleEntryOf(JNIEnv* env, jobject obj);
 int isModulePresent(JNIEnv* env, jobject obj);
 // Takes ownership of key (a global reference) and of entry->moduleName,
 // unless it returns with a Java exception pending. When key's object is

@@ -7,6 +7,7 @@
 #include <sys/time.h>
 
 #include <string>
+#include <thread>
 
 #include "jvm_fixture.h"
 #include "raw_peer.h"
@@ -15,6 +16,8 @@
 extern "C" void Java_com_vok_smartcard_pkcs11_Pkcs11_connect(JNIEnv*, jobject, jstring, jstring,
                                                              jstring, jint);
 extern "C" void Java_com_vok_smartcard_pkcs11_Pkcs11_disconnect(JNIEnv*, jobject);
+extern "C" jlong Java_com_vok_smartcard_pkcs11_Pkcs11_C_1WaitForSlotEvent(JNIEnv*, jobject, jlong,
+                                                                          jlong);
 
 namespace {
 
@@ -78,6 +81,35 @@ TEST_F(DisconnectRace, TheModuleStaysLoadedUntilTheCallInsideItReturns) {
     ASSERT_TRUE(answer.ParseFromArray(payload.data(), static_cast<int>(payload.size())));
     EXPECT_EQ("C_WaitForSlotEvent", answer.name());
     EXPECT_EQ(CKR_OK, answer.result());
+    EXPECT_TRUE(voktest::waitUntil([] { return !moduleLoaded(); })) << "never unloaded";
+}
+
+// The same through the Java API: one Java thread inside a call while another
+// disconnects the object.
+TEST_F(DisconnectRace, AJavaCallKeepsTheModuleLoadedUntilItReturns) {
+    jobject self = voktest::newKey();
+    Java_com_vok_smartcard_pkcs11_Pkcs11_connect(
+        env_, self, env_->NewStringUTF(VOK_FAKE_VENDOR_LIBRARY),
+        env_->NewStringUTF("C_GetFunctionList"), nullptr, 0);
+    ASSERT_FALSE(env_->ExceptionCheck());
+    auto list = moduleFunction<CK_FUNCTION_LIST_PTR (*)()>("fake_vendor_function_list")();
+    ASSERT_EQ(CKR_OK, list->C_Initialize(nullptr));
+    moduleFunction<void (*)(CK_BBOOL)>("fake_vendor_set_blocking_wait")(CK_TRUE);
+    auto waiting = moduleFunction<CK_ULONG (*)()>("fake_vendor_waiting_count");
+    auto signal = moduleFunction<void (*)()>("fake_vendor_signal_slot_event");
+
+    std::thread caller([&] {
+        voktest::AttachedThread thread;
+        Java_com_vok_smartcard_pkcs11_Pkcs11_C_1WaitForSlotEvent(thread.env(), self, 0, 0);
+        thread.env()->ExceptionClear();
+    });
+    ASSERT_TRUE(voktest::waitUntil([&] { return waiting() == 1; }));
+    Java_com_vok_smartcard_pkcs11_Pkcs11_disconnect(env_, self);
+    // Unloading under the call hangs here or crashes; a test that got past
+    // that without the module could not join the caller.
+    ASSERT_TRUE(moduleLoaded()) << "unloaded under the running call";
+    signal();
+    caller.join();
     EXPECT_TRUE(voktest::waitUntil([] { return !moduleLoaded(); })) << "never unloaded";
 }
 
