@@ -64,37 +64,28 @@ public:
     pid_t pid() const { return pid_; }
     bool running() const { return pid_ > 0 && !exited_; }
 
-    // The next line of output, or false at end of output or after `limit`.
-    bool readLine(std::string* line, std::chrono::milliseconds limit = 30s) {
+    // Reads lines until one starts with `prefix`; returns it, or "" when none
+    // came before the end of output or `limit`.
+    std::string waitForLine(const std::string& prefix, std::chrono::milliseconds limit = 30s) {
         const auto deadline = Clock::now() + limit;
         for (;;) {
             size_t end = buffer_.find('\n');
             if (end != std::string::npos) {
-                *line = buffer_.substr(0, end);
+                lines_.push_back(buffer_.substr(0, end));
                 buffer_.erase(0, end + 1);
-                lines_.push_back(*line);
-                return true;
+                if (lines_.back().compare(0, prefix.size(), prefix) == 0) return lines_.back();
+                continue;
             }
             auto left =
                 std::chrono::duration_cast<std::chrono::milliseconds>(deadline - Clock::now());
-            if (left.count() <= 0) return false;
+            if (left.count() <= 0) return "";
             pollfd p{output_, POLLIN, 0};
             if (poll(&p, 1, static_cast<int>(left.count())) <= 0) continue;
             char chunk[512];
             ssize_t n = read(output_, chunk, sizeof chunk);
-            if (n <= 0) return false;
+            if (n <= 0) return "";
             buffer_.append(chunk, static_cast<size_t>(n));
         }
-    }
-
-    // Reads lines until one starts with `prefix`; returns it, or "" when none came.
-    std::string waitForLine(const std::string& prefix, std::chrono::milliseconds limit = 30s) {
-        const auto deadline = Clock::now() + limit;
-        std::string line;
-        while (readLine(
-            &line, std::chrono::duration_cast<std::chrono::milliseconds>(deadline - Clock::now())))
-            if (line.compare(0, prefix.size(), prefix) == 0) return line;
-        return "";
     }
 
     // Every line read so far, for failure messages.
