@@ -163,7 +163,8 @@ public:
                 if (c == number && !last.empty()) return ::testing::AssertionSuccess();
             std::this_thread::sleep_for(5ms);
         }
-        return ::testing::AssertionFailure() << "still in system call: " << last;
+        return ::testing::AssertionFailure() << "still in system call: " << last << "\n"
+                                             << transcript();
     }
 
 private:
