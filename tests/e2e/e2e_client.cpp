@@ -3,8 +3,8 @@
 // drives PKCS#11 calls through the library's function list.
 //
 //   vok_e2e_client <library> <serverId> steps [--already-initialized]
-//       runs the step table; one line per step ("ok <step>" or
-//       "FAIL <step>: <why>"), exit status 0 when every step passed.
+//       one round of the soak test's calls, then C_Finalize: "ok round" or
+//       "FAIL <why>", exit status 0 when it passed.
 //   vok_e2e_client <library> <serverId> call <function>...
 //       prints "connected", then for each function waits for a line on
 //       standard input, prints "calling <function>", makes the call and prints
@@ -27,12 +27,10 @@
 #include <sys/un.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <chrono>
 #include <cstdint>
 #include <cstdio>
 #include <cstring>
-#include <functional>
 #include <iostream>
 #include <random>
 #include <string>
@@ -92,202 +90,6 @@ Library openLibrary(const char* path, const char* serverId) {
     return library;
 }
 
-// ---- The step table -----------------------------------------------------------
-
-// What the steps share: the function list and the handles earlier steps made.
-struct Context {
-    CK_FUNCTION_LIST_PTR f = nullptr;
-    bool alreadyInitialized = false;
-    CK_SESSION_HANDLE session = CK_INVALID_HANDLE;
-    CK_OBJECT_HANDLE object = CK_INVALID_HANDLE;
-    CK_OBJECT_HANDLE aes = CK_INVALID_HANDLE;
-    std::string ciphertext;
-};
-
-// A step fails with a Failure: the rv of a call or an output was not as expected.
-struct Failure {
-    std::string why;
-};
-
-void expectRv(const char* call, CK_RV rv, CK_RV expected) {
-    if (rv != expected)
-        throw Failure{std::string(call) + " returned " + hexRv(rv) + ", expected " +
-                      hexRv(expected)};
-}
-
-void expectTrue(bool condition, const std::string& what) {
-    if (!condition) throw Failure{what};
-}
-
-template <size_t N>
-bool startsWith(const CK_UTF8CHAR (&field)[N], const std::string& text) {
-    return text.size() <= N && std::memcmp(field, text.data(), text.size()) == 0;
-}
-
-std::string bytesOf(const CK_ATTRIBUTE& a) {
-    return std::string(static_cast<const char*>(a.pValue), a.ulValueLen);
-}
-
-CK_ATTRIBUTE attribute(CK_ATTRIBUTE_TYPE type, const void* value, CK_ULONG length) {
-    return CK_ATTRIBUTE{type, const_cast<void*>(value), length};
-}
-
-// Reads one attribute of `object` with the two-call convention.
-std::string readAttribute(Context& c, CK_OBJECT_HANDLE object, CK_ATTRIBUTE_TYPE type) {
-    CK_ATTRIBUTE query = attribute(type, nullptr, 0);
-    expectRv("C_GetAttributeValue (length)", c.f->C_GetAttributeValue(c.session, object, &query, 1),
-             CKR_OK);
-    std::vector<char> value(query.ulValueLen);
-    CK_ATTRIBUTE read = attribute(type, value.data(), value.size());
-    expectRv("C_GetAttributeValue", c.f->C_GetAttributeValue(c.session, object, &read, 1), CKR_OK);
-    return bytesOf(read);
-}
-
-CK_ULONG sessionState(Context& c) {
-    CK_SESSION_INFO info{};
-    expectRv("C_GetSessionInfo", c.f->C_GetSessionInfo(c.session, &info), CKR_OK);
-    return info.state;
-}
-
-std::string text(const CK_BYTE* bytes, CK_ULONG length) {
-    return std::string(reinterpret_cast<const char*>(bytes), length);
-}
-
-// Runs an in/out data function on `input` into a 32-byte buffer.
-std::string update(Context& c, const char* name, CK_C_EncryptUpdate call,
-                   const std::string& input) {
-    std::vector<CK_BYTE> in(input.begin(), input.end());
-    CK_BYTE out[32] = {0};
-    CK_ULONG length = sizeof out;
-    expectRv(name, call(c.session, in.data(), in.size(), out, &length), CKR_OK);
-    return text(out, std::min<CK_ULONG>(length, sizeof out));
-}
-
-struct Step {
-    const char* name;
-    std::function<void(Context&)> run;  // throws Failure
-};
-
-const char kUserPin[] = "1234";
-const char kObjectLabel[] = "e2e data";
-const char kObjectValue[] = "hello";
-const std::string kPlain = "sixteen byte msg";
-CK_BYTE kIv[16] = {1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 13, 14, 15, 16};
-CK_MECHANISM kCbc = {CKM_AES_CBC, kIv, sizeof kIv};
-
-// The table, in the order a real application would call: enough of a session
-// to show a service at work. Each function's own rules are the unit tests'.
-const std::vector<Step>& steps() {
-    static const std::vector<Step> table = {
-        {"C_Initialize",
-         [](Context& c) {
-             expectRv("C_Initialize", c.f->C_Initialize(nullptr),
-                      c.alreadyInitialized ? CKR_CRYPTOKI_ALREADY_INITIALIZED : CKR_OK);
-         }},
-        {"C_GetInfo",
-         [](Context& c) {
-             CK_INFO info{};
-             expectRv("C_GetInfo", c.f->C_GetInfo(&info), CKR_OK);
-             expectTrue(info.cryptokiVersion.major == 2 && info.cryptokiVersion.minor == 40,
-                        "cryptokiVersion is not 2.40");
-             expectTrue(startsWith(info.manufacturerID, "Vok test vendor"), "manufacturerID");
-             expectTrue(info.libraryVersion.minor == 2, "libraryVersion.minor is not 2");
-         }},
-        {"C_OpenSession",
-         [](Context& c) {
-             expectRv("C_OpenSession",
-                      c.f->C_OpenSession(1, CKF_SERIAL_SESSION | CKF_RW_SESSION, nullptr, nullptr,
-                                         &c.session),
-                      CKR_OK);
-             expectTrue(c.session != CK_INVALID_HANDLE, "no session handle");
-         }},
-        {"C_Login",
-         [](Context& c) {
-             CK_UTF8CHAR pin[sizeof kUserPin];
-             std::memcpy(pin, kUserPin, sizeof kUserPin);
-             expectRv("C_Login", c.f->C_Login(c.session, CKU_USER, pin, sizeof kUserPin - 1),
-                      CKR_OK);
-             expectTrue(sessionState(c) == CKS_RW_USER_FUNCTIONS, "not logged in");
-         }},
-        {"C_CreateObject",
-         [](Context& c) {
-             CK_OBJECT_CLASS dataClass = CKO_DATA;
-             CK_BBOOL no = CK_FALSE;
-             CK_ATTRIBUTE object[] = {
-                 attribute(CKA_CLASS, &dataClass, sizeof dataClass),
-                 attribute(CKA_TOKEN, &no, sizeof no),
-                 attribute(CKA_LABEL, kObjectLabel, sizeof kObjectLabel - 1),
-                 attribute(CKA_VALUE, kObjectValue, sizeof kObjectValue - 1),
-             };
-             expectRv("C_CreateObject", c.f->C_CreateObject(c.session, object, 4, &c.object),
-                      CKR_OK);
-             // Handles above 32 bits: a truncating hop would hand back another.
-             expectTrue(c.object > 0xFFFFFFFFUL, "object handle " + std::to_string(c.object));
-         }},
-        {"C_GetAttributeValue",
-         [](Context& c) {
-             expectTrue(readAttribute(c, c.object, CKA_LABEL) == kObjectLabel, "label");
-             expectTrue(readAttribute(c, c.object, CKA_VALUE) == kObjectValue, "value");
-         }},
-        {"C_GenerateKey",
-         [](Context& c) {
-             CK_ULONG length = 16;
-             CK_ATTRIBUTE valueLen = attribute(CKA_VALUE_LEN, &length, sizeof length);
-             CK_MECHANISM aes = {CKM_AES_KEY_GEN, nullptr, 0};
-             expectRv("C_GenerateKey", c.f->C_GenerateKey(c.session, &aes, &valueLen, 1, &c.aes),
-                      CKR_OK);
-             expectTrue(c.aes > 0xFFFFFFFFUL, "key handle " + std::to_string(c.aes));
-         }},
-        {"C_EncryptInit/C_Encrypt",
-         [](Context& c) {
-             expectRv("C_EncryptInit", c.f->C_EncryptInit(c.session, &kCbc, c.aes), CKR_OK);
-             c.ciphertext = update(c, "C_Encrypt", c.f->C_Encrypt, kPlain);
-             expectTrue(c.ciphertext.size() == 16 && c.ciphertext != kPlain, "ciphertext");
-         }},
-        // The PKCS#11 two-call form: the length first, then the data.
-        {"C_DecryptInit/C_Decrypt",
-         [](Context& c) {
-             expectRv("C_DecryptInit", c.f->C_DecryptInit(c.session, &kCbc, c.aes), CKR_OK);
-             std::vector<CK_BYTE> in(c.ciphertext.begin(), c.ciphertext.end());
-             CK_ULONG length = 0;
-             expectRv("C_Decrypt (length)",
-                      c.f->C_Decrypt(c.session, in.data(), in.size(), nullptr, &length), CKR_OK);
-             expectTrue(length == 16, "decrypted length " + std::to_string(length));
-             std::vector<CK_BYTE> out(length);
-             expectRv("C_Decrypt",
-                      c.f->C_Decrypt(c.session, in.data(), in.size(), out.data(), &length), CKR_OK);
-             expectTrue(text(out.data(), length) == kPlain, "round trip");
-         }},
-        {"C_CloseSession",
-         [](Context& c) {
-             expectRv("C_CloseSession", c.f->C_CloseSession(c.session), CKR_OK);
-             CK_SESSION_INFO info{};
-             expectRv("C_GetSessionInfo (closed)", c.f->C_GetSessionInfo(c.session, &info),
-                      CKR_SESSION_HANDLE_INVALID);
-         }},
-        {"C_Finalize",
-         [](Context& c) { expectRv("C_Finalize", c.f->C_Finalize(nullptr), CKR_OK); }},
-    };
-    return table;
-}
-
-int runSteps(const Library& library, bool alreadyInitialized) {
-    Context context;
-    context.f = library.functions;
-    context.alreadyInitialized = alreadyInitialized;
-    int failures = 0;
-    for (const Step& step : steps()) {
-        try {
-            step.run(context);
-            std::cout << "ok " << step.name << std::endl;
-        } catch (const Failure& failure) {
-            std::cout << "FAIL " << step.name << ": " << failure.why << std::endl;
-            ++failures;
-        }
-    }
-    return failures == 0 ? 0 : 1;
-}
-
 // ---- Single calls on request ------------------------------------------------------
 
 int runCalls(const Library& library, const std::vector<std::string>& functions) {
@@ -315,58 +117,90 @@ int runCalls(const Library& library, const std::vector<std::string>& functions) 
     return 0;
 }
 
-// ---- Rounds of mixed calls for the soak test ---------------------------------------
+// ---- Rounds of mixed calls: the soak test's, and the steps of one ---------------
+
+// A call's rv or an output was not as expected.
+struct Failure {
+    std::string why;
+};
+
+void expectTrue(bool condition, const std::string& what) {
+    if (!condition) throw Failure{what};
+}
 
 // A round gives up at the channel's failure code: the service may be gone.
 struct ChannelLost {
     std::string call;
 };
 
-void soakRv(const char* call, CK_RV rv, CK_RV expected, CK_RV alsoFine = CKR_OK) {
+void expectRv(const char* call, CK_RV rv, CK_RV expected, CK_RV alsoFine = CKR_OK) {
     if (rv == kChannelFailure) throw ChannelLost{call};
-    if (rv != expected && rv != alsoFine) expectRv(call, rv, expected);
+    expectTrue(rv == expected || rv == alsoFine,
+               std::string(call) + " returned " + hexRv(rv) + ", expected " + hexRv(expected));
 }
 
-void soakRound(CK_FUNCTION_LIST_PTR f, std::mt19937& random) {
+CK_ATTRIBUTE attribute(CK_ATTRIBUTE_TYPE type, const void* value, CK_ULONG length) {
+    return CK_ATTRIBUTE{type, const_cast<void*>(value), length};
+}
+
+std::string text(const void* bytes, CK_ULONG length) {
+    return std::string(static_cast<const char*>(bytes), length);
+}
+
+CK_BYTE kIv[16] = {1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 13, 14, 15, 16};
+CK_MECHANISM kCbc = {CKM_AES_CBC, kIv, sizeof kIv};
+
+// initialized: what C_Initialize must return; the soak test also takes
+// CKR_CRYPTOKI_ALREADY_INITIALIZED.
+void round(CK_FUNCTION_LIST_PTR f, std::mt19937& random, CK_RV initialized, CK_RV alsoFine) {
     std::string value(1 + random() % 200, '\0'), plain(16 * (1 + random() % 4), '\0');
     for (char& c : value) c = static_cast<char>(random());
     for (char& c : plain) c = static_cast<char>(random());
-    soakRv("C_Initialize", f->C_Initialize(nullptr), CKR_OK, CKR_CRYPTOKI_ALREADY_INITIALIZED);
+    expectRv("C_Initialize", f->C_Initialize(nullptr), initialized, alsoFine);
     // Clients killed earlier leave their sessions open; only this one is served now.
-    soakRv("C_CloseAllSessions", f->C_CloseAllSessions(1), CKR_OK);
+    expectRv("C_CloseAllSessions", f->C_CloseAllSessions(1), CKR_OK);
     CK_INFO info{};
-    soakRv("C_GetInfo", f->C_GetInfo(&info), CKR_OK);
-    expectTrue(startsWith(info.manufacturerID, "Vok test vendor"), "C_GetInfo: manufacturerID");
+    expectRv("C_GetInfo", f->C_GetInfo(&info), CKR_OK);
+    expectTrue(text(info.manufacturerID, 15) == "Vok test vendor" &&
+                   info.cryptokiVersion.minor == 40 && info.libraryVersion.minor == 2,
+               "C_GetInfo: another CK_INFO");
     CK_SESSION_HANDLE session = CK_INVALID_HANDLE;
-    soakRv("C_OpenSession",
-           f->C_OpenSession(1, CKF_SERIAL_SESSION | CKF_RW_SESSION, nullptr, nullptr, &session),
-           CKR_OK);
+    expectRv("C_OpenSession",
+             f->C_OpenSession(1, CKF_SERIAL_SESSION | CKF_RW_SESSION, nullptr, nullptr, &session),
+             CKR_OK);
     CK_OBJECT_CLASS dataClass = CKO_DATA;
     CK_ATTRIBUTE object[] = {attribute(CKA_CLASS, &dataClass, sizeof dataClass),
                              attribute(CKA_VALUE, value.data(), value.size())};
     CK_OBJECT_HANDLE data = CK_INVALID_HANDLE, key = CK_INVALID_HANDLE;
-    soakRv("C_CreateObject", f->C_CreateObject(session, object, 2, &data), CKR_OK);
+    expectRv("C_CreateObject", f->C_CreateObject(session, object, 2, &data), CKR_OK);
+    // Handles above 32 bits: a truncating hop would hand back another.
+    expectTrue(data > 0xFFFFFFFFUL, "C_CreateObject: handle " + std::to_string(data));
     std::vector<char> read(value.size() + 8);
     CK_ATTRIBUTE query = attribute(CKA_VALUE, read.data(), read.size());
-    soakRv("C_GetAttributeValue", f->C_GetAttributeValue(session, data, &query, 1), CKR_OK);
-    expectTrue(bytesOf(query) == value, "C_GetAttributeValue: another value");
+    expectRv("C_GetAttributeValue", f->C_GetAttributeValue(session, data, &query, 1), CKR_OK);
+    expectTrue(text(query.pValue, query.ulValueLen) == value, "C_GetAttributeValue: another value");
     CK_ULONG keyLength = 16;
     CK_ATTRIBUTE valueLen = attribute(CKA_VALUE_LEN, &keyLength, sizeof keyLength);
     CK_MECHANISM aes = {CKM_AES_KEY_GEN, nullptr, 0};
-    soakRv("C_GenerateKey", f->C_GenerateKey(session, &aes, &valueLen, 1, &key), CKR_OK);
+    expectRv("C_GenerateKey", f->C_GenerateKey(session, &aes, &valueLen, 1, &key), CKR_OK);
     std::vector<CK_BYTE> in(plain.begin(), plain.end()), out(plain.size() + 16);
     CK_ULONG length = out.size();
-    soakRv("C_EncryptInit", f->C_EncryptInit(session, &kCbc, key), CKR_OK);
-    soakRv("C_Encrypt", f->C_Encrypt(session, in.data(), in.size(), out.data(), &length), CKR_OK);
+    expectRv("C_EncryptInit", f->C_EncryptInit(session, &kCbc, key), CKR_OK);
+    expectRv("C_Encrypt", f->C_Encrypt(session, in.data(), in.size(), out.data(), &length), CKR_OK);
     expectTrue(length == plain.size() && text(out.data(), length) != plain, "C_Encrypt: output");
     in.assign(out.begin(), out.begin() + length);
-    length = out.size();
-    soakRv("C_DecryptInit", f->C_DecryptInit(session, &kCbc, key), CKR_OK);
-    soakRv("C_Decrypt", f->C_Decrypt(session, in.data(), in.size(), out.data(), &length), CKR_OK);
+    // The two-call form: the length first, then the data.
+    length = 0;
+    expectRv("C_DecryptInit", f->C_DecryptInit(session, &kCbc, key), CKR_OK);
+    expectRv("C_Decrypt", f->C_Decrypt(session, in.data(), in.size(), nullptr, &length), CKR_OK);
+    expectTrue(length == plain.size(), "C_Decrypt: length " + std::to_string(length));
+    expectRv("C_Decrypt", f->C_Decrypt(session, in.data(), in.size(), out.data(), &length), CKR_OK);
     expectTrue(text(out.data(), length) == plain, "C_Decrypt: another plaintext");
-    soakRv("C_DestroyObject", f->C_DestroyObject(session, data), CKR_OK);
-    soakRv("C_DestroyObject", f->C_DestroyObject(session, key), CKR_OK);
-    soakRv("C_CloseSession", f->C_CloseSession(session), CKR_OK);
+    expectRv("C_DestroyObject", f->C_DestroyObject(session, data), CKR_OK);
+    expectRv("C_DestroyObject", f->C_DestroyObject(session, key), CKR_OK);
+    expectRv("C_CloseSession", f->C_CloseSession(session), CKR_OK);
+    CK_SESSION_INFO closed{};
+    expectRv("C_GetSessionInfo", f->C_GetSessionInfo(session, &closed), CKR_SESSION_HANDLE_INVALID);
 }
 
 int soak(const Library& library, int rounds) {
@@ -374,7 +208,7 @@ int soak(const Library& library, int rounds) {
     int wrong = 0;
     for (int i = 0; i < rounds; ++i) {
         try {
-            soakRound(library.functions, random);
+            round(library.functions, random, CKR_OK, CKR_CRYPTOKI_ALREADY_INITIALIZED);
             std::cout << "round ok" << std::endl;
         } catch (const ChannelLost& lost) {
             // As an application would, it starts again in a new process.
@@ -386,6 +220,23 @@ int soak(const Library& library, int rounds) {
         }
     }
     return wrong == 0 ? 0 : 1;
+}
+
+int steps(const Library& library, bool alreadyInitialized) {
+    std::mt19937 random(static_cast<unsigned>(getpid()));
+    const CK_RV initialized = alreadyInitialized ? CKR_CRYPTOKI_ALREADY_INITIALIZED : CKR_OK;
+    try {
+        round(library.functions, random, initialized, initialized);
+        expectRv("C_Finalize", library.functions->C_Finalize(nullptr), CKR_OK);
+    } catch (const ChannelLost& lost) {
+        std::cout << "FAIL " << lost.call << ": channel failure" << std::endl;
+        return 1;
+    } catch (const Failure& failure) {
+        std::cout << "FAIL " << failure.why << std::endl;
+        return 1;
+    }
+    std::cout << "ok round" << std::endl;
+    return 0;
 }
 
 // ---- A request that never completes ---------------------------------------------
@@ -466,7 +317,7 @@ int main(int argc, char** argv) {
     if (mode == "stall") return stall(args[1]);
     if (mode == "steps") {
         bool alreadyInitialized = args.size() > 3 && args[3] == "--already-initialized";
-        return runSteps(openLibrary(args[0].c_str(), args[1].c_str()), alreadyInitialized);
+        return steps(openLibrary(args[0].c_str(), args[1].c_str()), alreadyInitialized);
     }
     if (mode == "soak" && args.size() > 3)
         return soak(openLibrary(args[0].c_str(), args[1].c_str()), std::stoi(args[3]));

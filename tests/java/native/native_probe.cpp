@@ -58,6 +58,35 @@ void throwIllegalState(JNIEnv* env, const char* message) {
     if (illegalState != nullptr) env->ThrowNew(illegalState, message);
 }
 
+// A symbol of the fake vendor module; null, with the Java exception pending, when missing.
+void* vendorSymbol(JNIEnv* env, jlong vendor, const char* name) {
+    void* symbol = dlsym(reinterpret_cast<void*>(vendor), name);
+    if (symbol == nullptr) throwIllegalState(env, "not the fake vendor module");
+    return symbol;
+}
+
+std::string utf(JNIEnv* env, jstring text) {
+    const char* chars = env->GetStringUTFChars(text, nullptr);
+    if (chars == nullptr) return {};
+    std::string out = chars;
+    env->ReleaseStringUTFChars(text, chars);
+    return out;
+}
+
+jobjectArray stringArray(JNIEnv* env, const std::vector<std::string>& texts) {
+    jclass stringClass = env->FindClass("java/lang/String");
+    if (stringClass == nullptr) return nullptr;
+    jobjectArray result =
+        env->NewObjectArray(static_cast<jsize>(texts.size()), stringClass, nullptr);
+    for (size_t i = 0; result != nullptr && i < texts.size(); ++i) {
+        jstring text = env->NewStringUTF(texts[i].c_str());
+        if (text == nullptr) return nullptr;
+        env->SetObjectArrayElement(result, static_cast<jsize>(i), text);
+        env->DeleteLocalRef(text);
+    }
+    return result;
+}
+
 }  // namespace
 
 extern "C" {
@@ -123,70 +152,43 @@ JNIEXPORT jlong JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_channelGetInfo
 // told, loaded until the test lets go.
 JNIEXPORT jlong JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_openVendor(JNIEnv* env, jclass,
                                                                              jstring path) {
-    const char* chars = env->GetStringUTFChars(path, nullptr);
-    if (chars == nullptr) return 0;
-    void* handle = dlopen(chars, RTLD_NOW | RTLD_LOCAL);
-    env->ReleaseStringUTFChars(path, chars);
+    void* handle = dlopen(utf(env, path).c_str(), RTLD_NOW | RTLD_LOCAL);
     if (handle == nullptr) throwIllegalState(env, dlerror());
     return reinterpret_cast<jlong>(handle);
 }
 
 JNIEXPORT void JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_setNextVendorRv(
     JNIEnv* env, jclass, jlong vendor, jstring function, jlong rv) {
-    using SetNextRv = CK_RV (*)(const char*, CK_RV);
-    auto setNextRv = reinterpret_cast<SetNextRv>(
-        dlsym(reinterpret_cast<void*>(vendor), "fake_vendor_set_next_rv"));
-    if (setNextRv == nullptr) {
-        throwIllegalState(env, "not the fake vendor module");
-        return;
-    }
-    const char* chars = env->GetStringUTFChars(function, nullptr);
-    if (chars == nullptr) return;
-    CK_RV result = setNextRv(chars, static_cast<CK_RV>(rv));
-    env->ReleaseStringUTFChars(function, chars);
-    if (result != CKR_OK) throwIllegalState(env, "fake_vendor_set_next_rv refused");
+    auto setNextRv = reinterpret_cast<CK_RV (*)(const char*, CK_RV)>(
+        vendorSymbol(env, vendor, "fake_vendor_set_next_rv"));
+    if (setNextRv != nullptr && setNextRv(utf(env, function).c_str(), static_cast<CK_RV>(rv)) != CKR_OK)
+        throwIllegalState(env, "fake_vendor_set_next_rv refused");
 }
 
 // The fake vendor's record as text, one element per call.
 JNIEXPORT jobjectArray JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_vendorCalls(JNIEnv* env,
                                                                                      jclass,
                                                                                      jlong vendor) {
-    using Count = CK_ULONG (*)();
-    using Text = CK_RV (*)(CK_ULONG, char*, CK_ULONG_PTR);
-    auto* handle = reinterpret_cast<void*>(vendor);
-    auto count = reinterpret_cast<Count>(dlsym(handle, "fake_vendor_call_count"));
-    auto text = reinterpret_cast<Text>(dlsym(handle, "fake_vendor_call_text"));
-    jclass stringClass = env->FindClass("java/lang/String");
-    if (count == nullptr || text == nullptr || stringClass == nullptr) {
-        throwIllegalState(env, "not the fake vendor module");
-        return nullptr;
-    }
-    const CK_ULONG n = count();
-    jobjectArray result = env->NewObjectArray(static_cast<jsize>(n), stringClass, nullptr);
-    for (CK_ULONG i = 0; result != nullptr && i < n; ++i) {
+    auto count = reinterpret_cast<CK_ULONG (*)()>(vendorSymbol(env, vendor, "fake_vendor_call_count"));
+    auto text = reinterpret_cast<CK_RV (*)(CK_ULONG, char*, CK_ULONG_PTR)>(
+        count != nullptr ? vendorSymbol(env, vendor, "fake_vendor_call_text") : nullptr);
+    if (text == nullptr) return nullptr;
+    std::vector<std::string> calls(count());
+    for (CK_ULONG i = 0; i < calls.size(); ++i) {
         CK_ULONG length = 0;
         if (text(i, nullptr, &length) != CKR_OK) break;
-        std::string call(length, '\0');
-        text(i, &call[0], &length);
-        call.resize(length);
-        jstring element = env->NewStringUTF(call.c_str());
-        if (element == nullptr) return nullptr;
-        env->SetObjectArrayElement(result, static_cast<jsize>(i), element);
-        env->DeleteLocalRef(element);
+        calls[i].resize(length);
+        text(i, &calls[i][0], &length);
+        calls[i].resize(length);
     }
-    return result;
+    return stringArray(env, calls);
 }
 
 // A fresh token in the fake vendor, with an empty record.
 JNIEXPORT void JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_resetVendor(JNIEnv* env, jclass,
                                                                              jlong vendor) {
-    auto reset =
-        reinterpret_cast<void (*)()>(dlsym(reinterpret_cast<void*>(vendor), "fake_vendor_reset"));
-    if (reset == nullptr) {
-        throwIllegalState(env, "not the fake vendor module");
-        return;
-    }
-    reset();
+    if (auto reset = reinterpret_cast<void (*)()>(vendorSymbol(env, vendor, "fake_vendor_reset")))
+        reset();
 }
 
 // Calls a control of the fake vendor that takes one CK_ULONG
@@ -195,15 +197,8 @@ JNIEXPORT void JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_controlVendor(J
                                                                                jlong vendor,
                                                                                jstring control,
                                                                                jlong value) {
-    const char* chars = env->GetStringUTFChars(control, nullptr);
-    if (chars == nullptr) return;
-    void* symbol = dlsym(reinterpret_cast<void*>(vendor), chars);
-    env->ReleaseStringUTFChars(control, chars);
-    if (symbol == nullptr) {
-        throwIllegalState(env, "no such control");
-        return;
-    }
-    reinterpret_cast<void (*)(CK_ULONG)>(symbol)(static_cast<CK_ULONG>(value));
+    if (void* symbol = vendorSymbol(env, vendor, utf(env, control).c_str()))
+        reinterpret_cast<void (*)(CK_ULONG)>(symbol)(static_cast<CK_ULONG>(value));
 }
 
 JNIEXPORT void JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_closeVendor(JNIEnv*, jclass,
@@ -225,11 +220,7 @@ JNIEXPORT void JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_captureLog(JNIE
 JNIEXPORT jobjectArray JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_takeLog(JNIEnv* env,
                                                                                  jclass,
                                                                                  jstring tag) {
-    const char* chars = env->GetStringUTFChars(tag, nullptr);
-    if (chars == nullptr) return nullptr;
-    const std::string wanted = chars;
-    env->ReleaseStringUTFChars(tag, chars);
-
+    const std::string wanted = utf(env, tag);
     std::vector<std::string> texts;
     {
         std::lock_guard<std::mutex> lock(gLogMutex);
@@ -237,17 +228,7 @@ JNIEXPORT jobjectArray JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_takeLog
             if (line.tag == wanted) texts.push_back(line.text);
         gLog.clear();
     }
-    jclass stringClass = env->FindClass("java/lang/String");
-    if (stringClass == nullptr) return nullptr;
-    jobjectArray result =
-        env->NewObjectArray(static_cast<jsize>(texts.size()), stringClass, nullptr);
-    for (size_t i = 0; result != nullptr && i < texts.size(); ++i) {
-        jstring text = env->NewStringUTF(texts[i].c_str());
-        if (text == nullptr) return nullptr;
-        env->SetObjectArrayElement(result, static_cast<jsize>(i), text);
-        env->DeleteLocalRef(text);
-    }
-    return result;
+    return stringArray(env, texts);
 }
 
 }  // extern "C"
