@@ -47,23 +47,17 @@ TEST_F(EveryProxy, ReturnsTheWholeResultAndLeavesOutputsWhenNoResponseMessage) {
     }
 }
 
-TEST_F(EveryProxy, ReturnsAllOnesAndLeavesOutputsWhenTheServiceAnswersNothing) {
-    for (const ProxyCall& proxy : everyProxyCall()) {
-        SCOPED_TRACE(proxy.name);
-        service.scriptRaw("");
-        EXPECT_EQ(kAllOnes, run(proxy));
-        EXPECT_TRUE(untouched());
-    }
-}
-
-TEST_F(EveryProxy, ReturnsAllOnesWhenTheAnswerLacksItsResult) {
+// No answer at all, or one without its result.
+TEST_F(EveryProxy, ReturnsAllOnesAndLeavesOutputsWithoutAResult) {
     for (const ProxyCall& proxy : everyProxyCall()) {
         SCOPED_TRACE(proxy.name);
         pkcs11::OperationResult nameOnly;
         nameOnly.set_name(proxy.name);
-        service.scriptRaw(nameOnly.SerializePartialAsString());
-        EXPECT_EQ(kAllOnes, run(proxy));
-        EXPECT_TRUE(untouched());
+        for (const std::string& raw : {std::string(), nameOnly.SerializePartialAsString()}) {
+            service.scriptRaw(raw);
+            EXPECT_EQ(kAllOnes, run(proxy));
+            EXPECT_TRUE(untouched());
+        }
     }
 }
 
