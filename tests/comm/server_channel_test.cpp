@@ -10,7 +10,6 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <array>
 #include <atomic>
 #include <cerrno>
 #include <cstdio>
@@ -35,6 +34,35 @@ extern "C" int __wrap_accept(int fd, sockaddr* address, socklen_t* length) {
         return -1;
     }
     return __real_accept(fd, address, length);
+}
+
+// The system calls an exchange makes, counted per end while `counting`.
+namespace {
+std::atomic<bool> counting{false};
+std::atomic<pthread_t> clientThread;
+struct Counts {
+    std::atomic<int> sendmsg{0}, send{0}, recv{0};
+};
+Counts clientCalls, serverCalls;
+Counts& callsOfThisThread() {
+    return pthread_equal(pthread_self(), clientThread.load()) ? clientCalls : serverCalls;
+}
+}  // namespace
+
+extern "C" ssize_t __real_sendmsg(int fd, const msghdr* message, int flags);
+extern "C" ssize_t __wrap_sendmsg(int fd, const msghdr* message, int flags) {
+    if (counting) ++callsOfThisThread().sendmsg;
+    return __real_sendmsg(fd, message, flags);
+}
+extern "C" ssize_t __real_send(int fd, const void* buf, size_t len, int flags);
+extern "C" ssize_t __wrap_send(int fd, const void* buf, size_t len, int flags) {
+    if (counting) ++callsOfThisThread().send;
+    return __real_send(fd, buf, len, flags);
+}
+extern "C" ssize_t __real_recv(int fd, void* buf, size_t len, int flags);
+extern "C" ssize_t __wrap_recv(int fd, void* buf, size_t len, int flags) {
+    if (counting) ++callsOfThisThread().recv;
+    return __real_recv(fd, buf, len, flags);
 }
 
 namespace voktest {
@@ -401,6 +429,31 @@ TEST_F(ServerChannelTest, IdsDifferingOnlyInTheirFirstCharacterMeet) {
     int32_t status = -1;
     EXPECT_EQ("ping", exchangeText("ping", &status));
     EXPECT_EQ(0, status);
+}
+
+// A frame leaves in one sendmsg, and an answer's header and small payload
+// arrive with one recv.
+TEST_F(ServerChannelTest, AnExchangeIsOneSendmsgAndOneRecvAtEachEnd) {
+    startServer(id);
+    ASSERT_EQ(0, vokpkcs11_comm_client_init(id.c_str()));
+    clientThread = pthread_self();
+    constexpr int kExchanges = 10;
+    counting = true;
+    for (int i = 0; i < kExchanges; ++i) {
+        const std::string request(static_cast<size_t>(100 + i), 'x');
+        int32_t status = -1;
+        EXPECT_EQ(request, exchangeText(request, &status));
+        EXPECT_EQ(0, status);
+    }
+    counting = false;
+    EXPECT_EQ(clientCalls.sendmsg, kExchanges);
+    EXPECT_EQ(clientCalls.send, 0);
+    EXPECT_EQ(clientCalls.recv, 2 * kExchanges);  // the drain's, and the answer's
+    EXPECT_EQ(serverCalls.sendmsg, kExchanges);
+    EXPECT_EQ(serverCalls.send, 0);
+    // The last recv may be the one that waits for the next request.
+    EXPECT_GE(serverCalls.recv, kExchanges);
+    EXPECT_LE(serverCalls.recv, kExchanges + 1);
 }
 
 // Requests and answers around the sizes of both ends' receive stages (64 KiB
