@@ -40,41 +40,34 @@ struct OutputProxy {
                     return SentOutput{op.request().has_##data(), op.request().data(),       \
                                       op.request().length()};                               \
                 }}
-// clang-format on
+// The two argument shapes: output only, and input then output.
+#define OUT(function, field, request, data, length) \
+    OUTPUT_PROXY(function, field, request, data, length, kSession, out, outLen)
+#define IN_OUT(function, field, request, data, length) \
+    OUTPUT_PROXY(function, field, request, data, length, kSession, gIn, 4, out, outLen)
 
 const OutputProxy kOutputProxies[] = {
-    OUTPUT_PROXY(C_GetOperationState, 22, getoperationstate, poperationstate, puloperationstatelen,
-                 kSession, out, outLen),
-    OUTPUT_PROXY(C_Encrypt, 11, enc, pencrypteddata, pulencrypteddatalen, kSession, gIn, 4, out,
-                 outLen),
-    OUTPUT_PROXY(C_EncryptUpdate, 27, encryptupdate, pencryptedpart, pulencryptedpartlen, kSession,
-                 gIn, 4, out, outLen),
-    OUTPUT_PROXY(C_EncryptFinal, 28, encryptfinal, plastencryptedpart, pullastencryptedpartlen,
-                 kSession, out, outLen),
-    OUTPUT_PROXY(C_Decrypt, 12, dec, pdata, puldatalen, kSession, gIn, 4, out, outLen),
-    OUTPUT_PROXY(C_DecryptUpdate, 29, decryptupdate, ppart, pulpartlen, kSession, gIn, 4, out,
-                 outLen),
-    OUTPUT_PROXY(C_DecryptFinal, 30, decryptfinal, plastpart, pullastpartlen, kSession, out,
-                 outLen),
-    OUTPUT_PROXY(C_Digest, 18, digest, pdigest, puldigestlen, kSession, gIn, 4, out, outLen),
-    OUTPUT_PROXY(C_DigestFinal, 31, digestfinal, pdigest, puldigestlen, kSession, out, outLen),
-    OUTPUT_PROXY(C_Sign, 13, sign, psignature, pulsignaturelen, kSession, gIn, 4, out, outLen),
-    OUTPUT_PROXY(C_SignFinal, 32, signfinal, psignature, pulsignaturelen, kSession, out, outLen),
-    OUTPUT_PROXY(C_SignRecover, 33, signrecover, psignature, pulsignaturelen, kSession, gIn, 4, out,
-                 outLen),
-    OUTPUT_PROXY(C_VerifyRecover, 34, verifyrecover, pdata, puldatalen, kSession, gIn, 4, out,
-                 outLen),
-    OUTPUT_PROXY(C_DigestEncryptUpdate, 35, digestencryptupdate, pencryptedpart,
-                 pulencryptedpartlen, kSession, gIn, 4, out, outLen),
-    OUTPUT_PROXY(C_DecryptDigestUpdate, 36, decryptdigestupdate, ppart, pulpartlen, kSession, gIn,
-                 4, out, outLen),
-    OUTPUT_PROXY(C_SignEncryptUpdate, 37, signencryptupdate, pencryptedpart, pulencryptedpartlen,
-                 kSession, gIn, 4, out, outLen),
-    OUTPUT_PROXY(C_DecryptVerifyUpdate, 38, decryptverifyupdate, ppart, pulpartlen, kSession, gIn,
-                 4, out, outLen),
+    OUT(C_GetOperationState, 22, getoperationstate, poperationstate, puloperationstatelen),
+    IN_OUT(C_Encrypt, 11, enc, pencrypteddata, pulencrypteddatalen),
+    IN_OUT(C_EncryptUpdate, 27, encryptupdate, pencryptedpart, pulencryptedpartlen),
+    OUT(C_EncryptFinal, 28, encryptfinal, plastencryptedpart, pullastencryptedpartlen),
+    IN_OUT(C_Decrypt, 12, dec, pdata, puldatalen),
+    IN_OUT(C_DecryptUpdate, 29, decryptupdate, ppart, pulpartlen),
+    OUT(C_DecryptFinal, 30, decryptfinal, plastpart, pullastpartlen),
+    IN_OUT(C_Digest, 18, digest, pdigest, puldigestlen),
+    OUT(C_DigestFinal, 31, digestfinal, pdigest, puldigestlen),
+    IN_OUT(C_Sign, 13, sign, psignature, pulsignaturelen),
+    OUT(C_SignFinal, 32, signfinal, psignature, pulsignaturelen),
+    IN_OUT(C_SignRecover, 33, signrecover, psignature, pulsignaturelen),
+    IN_OUT(C_VerifyRecover, 34, verifyrecover, pdata, puldatalen),
+    IN_OUT(C_DigestEncryptUpdate, 35, digestencryptupdate, pencryptedpart, pulencryptedpartlen),
+    IN_OUT(C_DecryptDigestUpdate, 36, decryptdigestupdate, ppart, pulpartlen),
+    IN_OUT(C_SignEncryptUpdate, 37, signencryptupdate, pencryptedpart, pulencryptedpartlen),
+    IN_OUT(C_DecryptVerifyUpdate, 38, decryptverifyupdate, ppart, pulpartlen),
     OUTPUT_PROXY(C_WrapKey, 41, wrapkey, pwrappedkey, pulwrappedkeylen, kSession, &gMechanism, kKey,
                  kOtherKey, out, outLen),
 };
+// clang-format on
 
 const std::string kProduced("\x01\x00\x02\x03\x04\x05\x06\x07\x08\x09", 10);
 constexpr size_t kGuard = 8;
@@ -83,61 +76,50 @@ class OutputBuffers : public ::testing::Test {
 protected:
     TestService& service = TestService::start();
 
-    // A caller's buffer of `capacity` bytes, then guard bytes. Its first byte
-    // is 0, so the request carries the field present and empty.
-    static std::vector<CK_BYTE> buffer(size_t capacity) {
-        std::vector<CK_BYTE> b(capacity + kGuard, 0xa5);
-        b[0] = 0;
-        return b;
-    }
     void script(const OutputProxy& proxy, CK_RV rv, const std::string& data, CK_ULONG length) {
         service.scriptRaw(encodeAnswer(proxy.name, rv, proxy.answerField, {data, length}));
     }
     SentOutput sent(const OutputProxy& proxy) const { return proxy.sent(service.lastRequest()); }
 };
 
-TEST_F(OutputBuffers, ResultComesBackIntoTheSameBufferWithItsLength) {
+// The caller's buffer holds `capacity` bytes, then guard bytes. Its first byte
+// is 0, so the request carries the field present and empty. A stated length
+// beyond the buffer never writes past it, even when the service claims
+// success: the caller learns the size it needs. Beyond what arrived, only
+// what arrived is copied, and the length says what was written.
+TEST_F(OutputBuffers, ResultComesBackWithinTheBufferWithItsLength) {
+    const struct {
+        CK_ULONG capacity;
+        CK_RV rv;
+        std::string data;
+        CK_ULONG stated;
+        CK_RV returned;
+        std::string written;  // the buffer's first bytes afterwards
+        size_t keptFrom;      // the pattern is intact from here to the end
+        CK_ULONG length;
+    } answers[] = {
+        {16, CKR_OK, kProduced, 10, CKR_OK, kProduced, 10, 10},
+        {4, CKR_BUFFER_TOO_SMALL, kProduced, 10, CKR_BUFFER_TOO_SMALL, "", 4, 10},
+        {4, CKR_OK, kProduced, 10, CKR_BUFFER_TOO_SMALL, "", 4, 10},
+        {16, CKR_OK, "abc", 12, CKR_OK, "abc", 3, 3},
+    };
     for (const OutputProxy& proxy : kOutputProxies) {
-        SCOPED_TRACE(proxy.name);
-        std::vector<CK_BYTE> out = buffer(16), expected = out;
-        memcpy(expected.data(), kProduced.data(), kProduced.size());
-        CK_ULONG length = 16;
-        script(proxy, CKR_OK, kProduced, kProduced.size());
-        EXPECT_EQ(CKR_OK, proxy.call(out.data(), &length));
-        EXPECT_TRUE(sent(proxy).present);
-        EXPECT_EQ("", sent(proxy).bytes);
-        EXPECT_EQ(16u, sent(proxy).capacity);
-        EXPECT_EQ(expected, out);
-        EXPECT_EQ(kProduced.size(), length);
-    }
-}
-
-// Also when the service claims success: the caller learns the size it needs.
-TEST_F(OutputBuffers, StatedLengthBeyondTheBufferNeverWritesPastIt) {
-    for (const OutputProxy& proxy : kOutputProxies) {
-        for (CK_RV rv : {CKR_BUFFER_TOO_SMALL, CKR_OK}) {
-            SCOPED_TRACE(proxy.name);
-            std::vector<CK_BYTE> out = buffer(4);
-            CK_ULONG length = 4;
-            script(proxy, rv, kProduced, kProduced.size());
-            EXPECT_EQ(CKR_BUFFER_TOO_SMALL, proxy.call(out.data(), &length));
-            EXPECT_EQ(kProduced.size(), length);
-            EXPECT_EQ(std::vector<CK_BYTE>(kGuard, 0xa5),
-                      std::vector<CK_BYTE>(out.begin() + 4, out.end()));
+        for (const auto& a : answers) {
+            SCOPED_TRACE(std::string(proxy.name) + " " + std::to_string(a.capacity) + " " +
+                         std::to_string(a.rv) + " " + std::to_string(a.stated));
+            std::vector<CK_BYTE> out(a.capacity + kGuard, 0xa5);
+            out[0] = 0;
+            CK_ULONG length = a.capacity;
+            script(proxy, a.rv, a.data, a.stated);
+            EXPECT_EQ(a.returned, proxy.call(out.data(), &length));
+            EXPECT_TRUE(sent(proxy).present);
+            EXPECT_EQ("", sent(proxy).bytes);
+            EXPECT_EQ(a.capacity, sent(proxy).capacity);
+            EXPECT_EQ(a.written, std::string(out.begin(), out.begin() + a.written.size()));
+            EXPECT_EQ(std::string(out.size() - a.keptFrom, '\xa5'),
+                      std::string(out.begin() + a.keptFrom, out.end()));
+            EXPECT_EQ(a.length, length);
         }
-    }
-}
-
-TEST_F(OutputBuffers, CopiesOnlyWhatArrivedWhenTheStatedLengthIsLonger) {
-    for (const OutputProxy& proxy : kOutputProxies) {
-        SCOPED_TRACE(proxy.name);
-        std::vector<CK_BYTE> out = buffer(16), expected = out;
-        memcpy(expected.data(), "abc", 3);
-        CK_ULONG length = 16;
-        script(proxy, CKR_OK, "abc", 12);
-        EXPECT_EQ(CKR_OK, proxy.call(out.data(), &length));
-        EXPECT_EQ(expected, out);
-        EXPECT_EQ(3u, length);  // never more than was written
     }
 }
 
@@ -192,7 +174,7 @@ constexpr CK_ULONG kAbove4GiB = (CK_ULONG{1} << 32) + 1;
 TEST_F(OutputBuffers, CapacityAboveFourGiBIsReadUpToTheZeroByte) {
     for (const OutputProxy& proxy : kOutputProxies) {
         SCOPED_TRACE(proxy.name);
-        std::vector<CK_BYTE> out = buffer(16);
+        std::vector<CK_BYTE> out(16, 0xa5);
         memcpy(out.data(), "abc", 4);
         CK_ULONG length = kAbove4GiB;
         proxy.call(out.data(), &length);
@@ -223,9 +205,9 @@ TEST_F(CryptoProxies, MechanismParameterTravelsByteForByteAndPointersByValue) {
     zeroed.pSourceData = nullptr;
     const std::string oaepBytes(reinterpret_cast<const char*>(&zeroed), sizeof(zeroed));
     Field mechanism = Field::message({CKM_RSA_PKCS_OAEP, oaepBytes, sizeof(oaep)});
-    const std::string byValue = encode(
-        {Field::repeated({CKM_SHA256, CKG_MGF1_SHA256, CKZ_DATA_SPECIFIED, 5}),
-         Field::attributes({{"label"}})});
+    const std::string byValue =
+        encode({Field::repeated({CKM_SHA256, CKG_MGF1_SHA256, CKZ_DATA_SPECIFIED, 5}),
+                Field::attributes({{"label"}})});
     mechanism.bytes += "\xa2\x06" + std::string(1, static_cast<char>(byValue.size())) + byValue;
     EXPECT_EQ(hex(encodeRequest("C_EncryptInit", 14, {kSession, mechanism, kKey})),
               hex(service.lastRequestBytes()));

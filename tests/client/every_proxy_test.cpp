@@ -1,5 +1,5 @@
 // Situations every proxy goes through alike: the exact request, the result
-// passed through, a failed channel; and the function list itself.
+// passed through, a failed or closed channel; and the function list itself.
 #include <gtest/gtest.h>
 
 #include <cstring>
@@ -8,13 +8,14 @@
 #include "proxy_calls.h"
 #include "test_service.h"
 #include "vok_client.h"
+#include "vok_comm.h"
 
 namespace voktest {
 namespace {
 
-class EveryProxy : public ::testing::Test {
+// Runs each proxy of the table on freshly patterned caller memory.
+class Proxies : public ::testing::Test {
 protected:
-    TestService& service = TestService::start();
     CK_FUNCTION_LIST_PTR list = functionList();
     CallerMemory before;
 
@@ -25,6 +26,33 @@ protected:
     }
     bool untouched() const { return memcmp(&before, &gCaller, sizeof(before)) == 0; }
 };
+
+// Each case runs in its own process: here the channel was never opened.
+TEST_F(Proxies, EveryProxyReturnsAllOnesBeforeClientInit) {
+    ASSERT_NE(nullptr, list);
+    for (const ProxyCall& proxy : everyProxyCall()) {
+        SCOPED_TRACE(proxy.name);
+        EXPECT_EQ(kAllOnes, run(proxy));
+        EXPECT_TRUE(untouched());
+    }
+}
+
+class EveryProxy : public Proxies {
+protected:
+    TestService& service = TestService::start();
+};
+
+TEST_F(EveryProxy, EveryProxyReturnsAllOnesAfterClientDeinitAndSendsNothing) {
+    ASSERT_EQ(CKR_OK, C_Finalize(nullptr));  // the channel worked
+    ASSERT_EQ(0, vokpkcs11_client_deinit());
+    const size_t sent = service.requestCount();
+    for (const ProxyCall& proxy : everyProxyCall()) {
+        SCOPED_TRACE(proxy.name);
+        EXPECT_EQ(kAllOnes, run(proxy));
+        EXPECT_TRUE(untouched());
+    }
+    EXPECT_EQ(sent, service.requestCount());
+}
 
 TEST_F(EveryProxy, SendsExactlyTheRequestForItsArguments) {
     for (const ProxyCall& proxy : everyProxyCall()) {
@@ -47,23 +75,17 @@ TEST_F(EveryProxy, ReturnsTheWholeResultAndLeavesOutputsWhenNoResponseMessage) {
     }
 }
 
-TEST_F(EveryProxy, ReturnsAllOnesAndLeavesOutputsWhenTheServiceAnswersNothing) {
-    for (const ProxyCall& proxy : everyProxyCall()) {
-        SCOPED_TRACE(proxy.name);
-        service.scriptRaw("");
-        EXPECT_EQ(kAllOnes, run(proxy));
-        EXPECT_TRUE(untouched());
-    }
-}
-
-TEST_F(EveryProxy, ReturnsAllOnesWhenTheAnswerLacksItsResult) {
+// No answer at all, or one without its result.
+TEST_F(EveryProxy, ReturnsAllOnesAndLeavesOutputsWithoutAResult) {
     for (const ProxyCall& proxy : everyProxyCall()) {
         SCOPED_TRACE(proxy.name);
         pkcs11::OperationResult nameOnly;
         nameOnly.set_name(proxy.name);
-        service.scriptRaw(nameOnly.SerializePartialAsString());
-        EXPECT_EQ(kAllOnes, run(proxy));
-        EXPECT_TRUE(untouched());
+        for (const std::string& raw : {std::string(), nameOnly.SerializePartialAsString()}) {
+            service.scriptRaw(raw);
+            EXPECT_EQ(kAllOnes, run(proxy));
+            EXPECT_TRUE(untouched());
+        }
     }
 }
 

@@ -260,40 +260,49 @@ TEST_F(SlotObjectProxies, FindObjectsCopiesNoMoreHandlesThanTheCallerAllows) {
 }
 
 TEST_F(SlotObjectProxies, HandlesComeBackFromTheirOwnFields) {
-    CK_OBJECT_HANDLE handle = 0, other = 0;
-    script("C_CreateObject", CKR_OK, 23, {Field::repeated({kObject, kKey})});
-    ASSERT_EQ(CKR_OK, C_CreateObject(kSession, nullptr, 0, &handle));
-    EXPECT_EQ(kObject, handle);
-    script("C_CopyObject", CKR_OK, 24, {});  // present, without a handle
-    ASSERT_EQ(CKR_OK, C_CopyObject(kSession, kObject, nullptr, 0, &handle));
-    EXPECT_EQ(kObject, handle);
-    script("C_CopyObject", CKR_OK, 24, {Field::repeated({kOtherKey})});
-    ASSERT_EQ(CKR_OK, C_CopyObject(kSession, kObject, nullptr, 0, &handle));
-    EXPECT_EQ(kOtherKey, handle);
-    script("C_OpenSession", CKR_OK, 6, {kSession});
-    ASSERT_EQ(CKR_OK, C_OpenSession(kSlot, kFlags, nullptr, nullptr, &handle));
-    EXPECT_EQ(kSession, handle);
-    script("C_GetObjectSize", CKR_OK, 25, {kKey});
-    ASSERT_EQ(CKR_OK, C_GetObjectSize(kSession, kObject, &handle));
-    EXPECT_EQ(kKey, handle);
-    script("C_GenerateKey", CKR_OK, 39, {kKey});
-    ASSERT_EQ(CKR_OK, C_GenerateKey(kSession, nullptr, nullptr, 0, &handle));
-    EXPECT_EQ(kKey, handle);
-    script("C_GenerateKeyPair", CKR_OK, 40, {kKey, kOtherKey});
-    ASSERT_EQ(CKR_OK,
-              C_GenerateKeyPair(kSession, nullptr, nullptr, 0, nullptr, 0, &handle, &other));
-    EXPECT_EQ(kKey, handle);
-    EXPECT_EQ(kOtherKey, other);
-    script("C_UnWrapKey", CKR_OK, 42, {kObject});
-    ASSERT_EQ(CKR_OK, C_UnwrapKey(kSession, nullptr, kKey, nullptr, 0, nullptr, 0, &handle));
-    EXPECT_EQ(kObject, handle);
-    // Deployed services answer C_DeriveKey under another name; the answer still counts.
-    script("C_UnDeriveKey", CKR_KEY_SIZE_RANGE, 43, {kOtherKey});
-    ASSERT_EQ(CKR_KEY_SIZE_RANGE, C_DeriveKey(kSession, nullptr, kKey, nullptr, 0, &handle));
-    EXPECT_EQ(kOtherKey, handle);
-    script("C_WaitForSlotEvent", CKR_OK, 44, {kSlot});
-    ASSERT_EQ(CKR_OK, C_WaitForSlotEvent(kFlags, &handle, nullptr));
-    EXPECT_EQ(kSlot, handle);
+    static CK_ULONG handle, other;
+    struct Case {
+        const char* name;  // the answer's
+        CK_RV (*call)();
+        int field;
+        std::vector<Field> fields;
+        CK_ULONG handle, other;  // afterwards; `other` starts as 0
+    };
+    // clang-format off
+    const Case cases[] = {
+        {"C_CreateObject", [] { return C_CreateObject(kSession, nullptr, 0, &handle); }, 23,
+         {Field::repeated({kObject, kKey})}, kObject, 0},
+        {"C_CopyObject", [] { return C_CopyObject(kSession, kObject, nullptr, 0, &handle); }, 24,
+         {}, kObject, 0},  // present, without a handle: the previous value stays
+        {"C_CopyObject", [] { return C_CopyObject(kSession, kObject, nullptr, 0, &handle); }, 24,
+         {Field::repeated({kOtherKey})}, kOtherKey, 0},
+        {"C_OpenSession", [] { return C_OpenSession(kSlot, kFlags, nullptr, nullptr, &handle); }, 6,
+         {kSession}, kSession, 0},
+        {"C_GetObjectSize", [] { return C_GetObjectSize(kSession, kObject, &handle); }, 25, {kKey},
+         kKey, 0},
+        {"C_GenerateKey", [] { return C_GenerateKey(kSession, nullptr, nullptr, 0, &handle); }, 39,
+         {kObject}, kObject, 0},
+        {"C_GenerateKeyPair", [] {
+             return C_GenerateKeyPair(kSession, nullptr, nullptr, 0, nullptr, 0, &handle, &other);
+         }, 40, {kKey, kOtherKey}, kKey, kOtherKey},
+        {"C_UnWrapKey", [] {
+             return C_UnwrapKey(kSession, nullptr, kKey, nullptr, 0, nullptr, 0, &handle);
+         }, 42, {kObject}, kObject, 0},
+        // Deployed services answer C_DeriveKey under another name; the answer still counts.
+        {"C_UnDeriveKey", [] { return C_DeriveKey(kSession, nullptr, kKey, nullptr, 0, &handle); },
+         43, {kOtherKey}, kOtherKey, 0},
+        {"C_WaitForSlotEvent", [] { return C_WaitForSlotEvent(kFlags, &handle, nullptr); }, 44,
+         {kSlot}, kSlot, 0},
+    };
+    // clang-format on
+    for (const Case& c : cases) {
+        SCOPED_TRACE(c.name);
+        other = 0;
+        script(c.name, CKR_KEY_SIZE_RANGE, c.field, c.fields);
+        ASSERT_EQ(CKR_KEY_SIZE_RANGE, c.call());
+        EXPECT_EQ(c.handle, handle);
+        EXPECT_EQ(c.other, other);
+    }
 }
 
 // Texts are read only within the caller's stated length (exact-size heap
@@ -322,75 +331,44 @@ TEST_F(SlotObjectProxies, NullOutputPointersAreNotDereferenced) {
         int field;
         std::vector<Field> fields;
     };
-    const Field empty = Field::message({});
+    const Field empty = Field::message({}), one = Field::repeated({1});
+    const Field attribute = Field::attributes({{CKA_ID, "x", 1}});
+    // clang-format off
     const Case cases[] = {
         {"C_GetInfo", [] { return C_GetInfo(nullptr); }, 3, {empty}},
         {"C_GetSlotInfo", [] { return C_GetSlotInfo(kSlot, nullptr); }, 5, {empty}},
         {"C_GetTokenInfo", [] { return C_GetTokenInfo(kSlot, nullptr); }, 16, {empty}},
         {"C_GetSessionInfo", [] { return C_GetSessionInfo(kSession, nullptr); }, 15, {empty}},
         {"C_GetMechanismInfo", [] { return C_GetMechanismInfo(kSlot, 0, nullptr); }, 17, {empty}},
-        {"C_GetSlotList",
-         [] { return C_GetSlotList(CK_FALSE, nullptr, nullptr); },
-         4,
-         {Field::repeated({1}), 1}},
-        {"C_GetMechanismList",
-         [] { return C_GetMechanismList(kSlot, nullptr, nullptr); },
-         21,
-         {Field::repeated({1}), 1}},
-        {"C_OpenSession",
-         [] { return C_OpenSession(kSlot, 0, nullptr, nullptr, nullptr); },
-         6,
-         {1}},
+        {"C_GetSlotList", [] { return C_GetSlotList(CK_FALSE, nullptr, nullptr); }, 4, {one, 1}},
+        {"C_GetMechanismList", [] { return C_GetMechanismList(kSlot, nullptr, nullptr); }, 21,
+         {one, 1}},
+        {"C_OpenSession", [] { return C_OpenSession(kSlot, 0, nullptr, nullptr, nullptr); }, 6, {1}},
         {"C_GetObjectSize", [] { return C_GetObjectSize(kSession, kObject, nullptr); }, 25, {1}},
-        {"C_GetAttributeValue",
-         [] { return C_GetAttributeValue(kSession, 0, nullptr, 2); },
-         7,
-         {Field::attributes({{CKA_ID, "x", 1}}), 1}},
-        {"C_FindObjectsInit",
-         [] { return C_FindObjectsInit(kSession, nullptr, 2); },
-         8,
-         {Field::attributes({{CKA_ID, "x", 1}})}},
-        {"C_FindObjects",
-         [] { return C_FindObjects(kSession, nullptr, 4, nullptr); },
-         9,
-         {Field::repeated({1}), 1}},
-        {"C_CreateObject",
-         [] { return C_CreateObject(kSession, nullptr, 0, nullptr); },
-         23,
-         {Field::repeated({1})}},
-        {"C_CopyObject",
-         [] { return C_CopyObject(kSession, kObject, nullptr, 0, nullptr); },
-         24,
-         {Field::repeated({1})}},
-        {"C_GenerateKey",
-         [] { return C_GenerateKey(kSession, nullptr, nullptr, 0, nullptr); },
-         39,
+        {"C_GetAttributeValue", [] { return C_GetAttributeValue(kSession, 0, nullptr, 2); }, 7,
+         {attribute, 1}},
+        {"C_FindObjectsInit", [] { return C_FindObjectsInit(kSession, nullptr, 2); }, 8, {attribute}},
+        {"C_FindObjects", [] { return C_FindObjects(kSession, nullptr, 4, nullptr); }, 9, {one, 1}},
+        {"C_CreateObject", [] { return C_CreateObject(kSession, nullptr, 0, nullptr); }, 23, {one}},
+        {"C_CopyObject", [] { return C_CopyObject(kSession, kObject, nullptr, 0, nullptr); }, 24,
+         {one}},
+        {"C_GenerateKey", [] { return C_GenerateKey(kSession, nullptr, nullptr, 0, nullptr); }, 39,
          {1}},
-        {"C_GenerateKeyPair",
-         [] {
+        {"C_GenerateKeyPair", [] {
              return C_GenerateKeyPair(kSession, nullptr, nullptr, 0, nullptr, 0, nullptr, nullptr);
-         },
-         40,
-         {1, 2}},
-        {"C_UnWrapKey",
-         [] { return C_UnwrapKey(kSession, nullptr, kKey, nullptr, 0, nullptr, 0, nullptr); },
-         42,
-         {1}},
-        {"C_DeriveKey",
-         [] { return C_DeriveKey(kSession, nullptr, kKey, nullptr, 0, nullptr); },
-         43,
+         }, 40, {1, 2}},
+        {"C_UnWrapKey", [] {
+             return C_UnwrapKey(kSession, nullptr, kKey, nullptr, 0, nullptr, 0, nullptr);
+         }, 42, {1}},
+        {"C_DeriveKey", [] { return C_DeriveKey(kSession, nullptr, kKey, nullptr, 0, nullptr); }, 43,
          {1}},
         {"C_Verify", [] { return C_Verify(kSession, nullptr, 0, nullptr, 4); }, 14, {"sig", 3}},
         {"C_SeedRandom", [] { return C_SeedRandom(kSession, nullptr, 4); }, 20, {"seed", 4}},
-        {"C_GenerateRandom",
-         [] { return C_GenerateRandom(kSession, nullptr, 4); },
-         19,
-         {"rand", 4}},
-        {"C_WaitForSlotEvent",
-         [] { return C_WaitForSlotEvent(kFlags, nullptr, nullptr); },
-         44,
+        {"C_GenerateRandom", [] { return C_GenerateRandom(kSession, nullptr, 4); }, 19, {"rand", 4}},
+        {"C_WaitForSlotEvent", [] { return C_WaitForSlotEvent(kFlags, nullptr, nullptr); }, 44,
          {kSlot}},
     };
+    // clang-format on
     for (const Case& c : cases) {
         SCOPED_TRACE(c.name);
         script(c.name, CKR_DEVICE_ERROR, c.field, c.fields);

@@ -3,7 +3,12 @@
 // check sees. The same test runs on the 64-bit host and the 32-bit targets.
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cstddef>
+#include <sstream>
+#include <string>
+#include <utility>
+#include <vector>
 
 #include "vok_pkcs11.h"
 
@@ -31,48 +36,41 @@ TEST(layout, LiteralSizes) {
         {"CK_SSL3_KEY_MAT_PARAMS", sizeof(CK_SSL3_KEY_MAT_PARAMS), 53, 65},
         {"CK_GCM_PARAMS", sizeof(CK_GCM_PARAMS), 40, 48},
     };
-    for (const Size& s : sizes)
-        EXPECT_EQ(s.actual, sizeof(void*) == 4 ? s.at32 : s.at64) << s.name;
+    for (const Size& s : sizes) EXPECT_EQ(s.actual, sizeof(void*) == 4 ? s.at32 : s.at64) << s.name;
 }
 
+// The standard order, written out: the header builds the list from its own
+// function table, so a slot out of place there shows only against this.
+const std::string kStandardOrder =
+    "C_Initialize C_Finalize C_GetInfo C_GetFunctionList C_GetSlotList C_GetSlotInfo "
+    "C_GetTokenInfo C_GetMechanismList C_GetMechanismInfo C_InitToken C_InitPIN C_SetPIN "
+    "C_OpenSession C_CloseSession C_CloseAllSessions C_GetSessionInfo C_GetOperationState "
+    "C_SetOperationState C_Login C_Logout C_CreateObject C_CopyObject C_DestroyObject "
+    "C_GetObjectSize C_GetAttributeValue C_SetAttributeValue C_FindObjectsInit C_FindObjects "
+    "C_FindObjectsFinal C_EncryptInit C_Encrypt C_EncryptUpdate C_EncryptFinal C_DecryptInit "
+    "C_Decrypt C_DecryptUpdate C_DecryptFinal C_DigestInit C_Digest C_DigestUpdate C_DigestKey "
+    "C_DigestFinal C_SignInit C_Sign C_SignUpdate C_SignFinal C_SignRecoverInit C_SignRecover "
+    "C_VerifyInit C_Verify C_VerifyUpdate C_VerifyFinal C_VerifyRecoverInit C_VerifyRecover "
+    "C_DigestEncryptUpdate C_DecryptDigestUpdate C_SignEncryptUpdate C_DecryptVerifyUpdate "
+    "C_GenerateKey C_GenerateKeyPair C_WrapKey C_UnwrapKey C_DeriveKey C_SeedRandom "
+    "C_GenerateRandom C_GetFunctionStatus C_CancelFunction C_WaitForSlotEvent";
+
 TEST(layout, FunctionListSlotOrder) {
-    struct Slot {
-        const char* name;
-        size_t offset;
-        size_t index;
-    };
-    const Slot slots[] = {
-        {"C_Initialize", offsetof(CK_FUNCTION_LIST, C_Initialize), 0},
-        {"C_Finalize", offsetof(CK_FUNCTION_LIST, C_Finalize), 1},
-        {"C_GetInfo", offsetof(CK_FUNCTION_LIST, C_GetInfo), 2},
-        {"C_GetFunctionList", offsetof(CK_FUNCTION_LIST, C_GetFunctionList), 3},
-        {"C_GetTokenInfo", offsetof(CK_FUNCTION_LIST, C_GetTokenInfo), 6},
-        {"C_InitPIN", offsetof(CK_FUNCTION_LIST, C_InitPIN), 10},
-        {"C_OpenSession", offsetof(CK_FUNCTION_LIST, C_OpenSession), 12},
-        {"C_Login", offsetof(CK_FUNCTION_LIST, C_Login), 18},
-        {"C_CreateObject", offsetof(CK_FUNCTION_LIST, C_CreateObject), 20},
-        {"C_FindObjectsFinal", offsetof(CK_FUNCTION_LIST, C_FindObjectsFinal), 28},
-        {"C_EncryptInit", offsetof(CK_FUNCTION_LIST, C_EncryptInit), 29},
-        {"C_DecryptInit", offsetof(CK_FUNCTION_LIST, C_DecryptInit), 33},
-        {"C_DigestInit", offsetof(CK_FUNCTION_LIST, C_DigestInit), 37},
-        {"C_DigestKey", offsetof(CK_FUNCTION_LIST, C_DigestKey), 40},
-        {"C_SignInit", offsetof(CK_FUNCTION_LIST, C_SignInit), 42},
-        {"C_VerifyInit", offsetof(CK_FUNCTION_LIST, C_VerifyInit), 48},
-        {"C_VerifyRecover", offsetof(CK_FUNCTION_LIST, C_VerifyRecover), 53},
-        {"C_DigestEncryptUpdate", offsetof(CK_FUNCTION_LIST, C_DigestEncryptUpdate), 54},
-        {"C_DecryptVerifyUpdate", offsetof(CK_FUNCTION_LIST, C_DecryptVerifyUpdate), 57},
-        {"C_GenerateKey", offsetof(CK_FUNCTION_LIST, C_GenerateKey), 58},
-        {"C_GenerateKeyPair", offsetof(CK_FUNCTION_LIST, C_GenerateKeyPair), 59},
-        {"C_WrapKey", offsetof(CK_FUNCTION_LIST, C_WrapKey), 60},
-        {"C_UnwrapKey", offsetof(CK_FUNCTION_LIST, C_UnwrapKey), 61},
-        {"C_DeriveKey", offsetof(CK_FUNCTION_LIST, C_DeriveKey), 62},
-        {"C_SeedRandom", offsetof(CK_FUNCTION_LIST, C_SeedRandom), 63},
-        {"C_GenerateRandom", offsetof(CK_FUNCTION_LIST, C_GenerateRandom), 64},
-        {"C_GetFunctionStatus", offsetof(CK_FUNCTION_LIST, C_GetFunctionStatus), 65},
-        {"C_CancelFunction", offsetof(CK_FUNCTION_LIST, C_CancelFunction), 66},
-        {"C_WaitForSlotEvent", offsetof(CK_FUNCTION_LIST, C_WaitForSlotEvent), 67},
-    };
-    for (const Slot& s : slots) EXPECT_EQ(s.offset, slot(s.index)) << s.name;
+    std::vector<std::pair<size_t, std::string>> slots;
+#define VOK_SLOT(name, params) slots.emplace_back(offsetof(CK_FUNCTION_LIST, name), #name);
+    VOK_CK_FUNCTIONS(VOK_SLOT)
+#undef VOK_SLOT
+    std::sort(slots.begin(), slots.end());
+    std::istringstream order(kStandardOrder);
+    std::string name;
+    size_t index = 0;
+    for (; order >> name; ++index) {
+        ASSERT_LT(index, slots.size());
+        EXPECT_EQ(name, slots[index].second) << index;
+        EXPECT_EQ(slot(index), slots[index].first) << name;
+    }
+    EXPECT_EQ(68u, index);
+    EXPECT_EQ(68u, slots.size());
 }
 
 }  // namespace
