@@ -8,6 +8,7 @@
 
 #include <functional>
 #include <ostream>
+#include <stdexcept>
 #include <string>
 #include <vector>
 
@@ -163,6 +164,12 @@ inline const FrameRow kFrameRows[] = {
     {"C_WaitForSlotEvent", C_WaitForSlotEvent_Server, "C_WaitForSlotEvent",
      ANSWER(waitforsloteventres)},
 };
+
+inline const FrameRow& frameOf(const std::string& command) {
+    for (const FrameRow& row : kFrameRows)
+        if (command == row.command) return row;
+    throw std::out_of_range("no handler for " + command);
+}
 
 // The fake module, reset, initialised, with a logged-in read/write user
 // session on slot 1 and whatever objects a test creates through it. The
