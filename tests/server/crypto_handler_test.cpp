@@ -357,13 +357,11 @@ protected:
         CK_ULONG length = 16;
         CK_ATTRIBUTE tmpl[] = {{CKA_VALUE_LEN, &length, sizeof length}};
         CK_MECHANISM aesGen{CKM_AES_KEY_GEN, nullptr, 0};
-        CK_MECHANISM secretGen{CKM_GENERIC_SECRET_KEY_GEN, nullptr, 0};
         ASSERT_EQ(CKR_OK, module_->C_GenerateKey(session_, &aesGen, tmpl, 1, &aes_));
-        ASSERT_EQ(CKR_OK, module_->C_GenerateKey(session_, &secretGen, tmpl, 1, &hmac_));
     }
 
     CK_SESSION_HANDLE session_ = 0;
-    CK_OBJECT_HANDLE aes_ = 0, hmac_ = 0;
+    CK_OBJECT_HANDLE aes_ = 0;
 };
 
 std::string encryptRequest(CK_SESSION_HANDLE session, uint64_t capacity) {
@@ -385,24 +383,6 @@ TEST_F(WithKeys, EncryptLengthQueryThenResult) {
     EXPECT_TRUE(query.encres().has_pencrypteddata());
     EXPECT_EQ("", query.encres().pencrypteddata());
     EXPECT_EQ(16u, query.encres().pulencrypteddatalen());
-}
-
-TEST_F(WithKeys, VerifyWithAValidSignatureFailsForTheModuleNeverSeesIt) {
-    CK_MECHANISM hmac{CKM_MD5_HMAC, nullptr, 0};
-    CK_BYTE data[] = "signed data", signature[16];
-    CK_ULONG length = sizeof signature;
-    ASSERT_EQ(CKR_OK, module_->C_SignInit(session_, &hmac, hmac_));
-    ASSERT_EQ(CKR_OK, module_->C_Sign(session_, data, sizeof data, signature, &length));
-    ASSERT_EQ(CKR_OK, module_->C_VerifyInit(session_, &hmac, hmac_));
-    const Result res = parsed(C_Verify_Server(requestBytes("C_Verify", [&](auto& op) {
-        auto* m = op.mutable_verify();
-        m->set_hsession(session_), m->set_pdata(data, sizeof data), m->set_uldatalen(sizeof data);
-        m->set_psignature(signature, sizeof signature), m->set_ulsignaturelen(sizeof signature);
-    })));
-    EXPECT_THAT(received("C_Verify"), IsSupersetOf({"pSignature 0 0 " + zeros(16) + " 0"}));
-    EXPECT_EQ(CKR_SIGNATURE_INVALID, res.result());
-    EXPECT_EQ(std::string(16, '\0'), res.verifyres().psignature());
-    EXPECT_EQ(16u, res.verifyres().ulsignaturelen());
 }
 
 // ---- Log lines ------------------------------------------------------------------------------

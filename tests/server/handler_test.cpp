@@ -408,21 +408,98 @@ TEST_F(PreparedToken, FoundHandlesComeBackUpToTheMaximum) {
     EXPECT_EQ(2u, two.findobjres().pulobjectcount());
 }
 
-// A module that fills every byte: each text runs on, but not past the end.
-TEST_F(PreparedToken, RunOnTextStopsAtTheEndOfTheStructure) {
-    CK_FUNCTION_LIST patched = *module_;
-    patched.C_GetTokenInfo = [](CK_SLOT_ID, CK_TOKEN_INFO_PTR info) -> CK_RV {
-        memset(info, 'A', sizeof *info);
-        return CKR_OK;
+// ---- Every field of the information structures ---------------------------------
+
+// A module that fills every byte of a structure with its offset's own
+// non-zero value: each number and version comes from its own place, and each
+// text runs on, but not past the end.
+char patternAt(size_t i) { return static_cast<char>(0x21 + i % 94); }
+template <class T>
+CK_RV fillPattern(T* out) {
+    for (size_t i = 0; i < sizeof(T); ++i) reinterpret_cast<char*>(out)[i] = patternAt(i);
+    return CKR_OK;
+}
+
+std::string str(const std::string& text) { return text; }
+std::string str(uint64_t number) { return std::to_string(number); }
+std::string str(const pkcs11::CK_VERSION& v) {
+    return std::to_string(v.vermajor()) + "." + std::to_string(v.verminor());
+}
+
+struct InfoField {
+    const char* command;
+    const char* member;
+    size_t size, offset;
+    char kind;  // 'T' text, 'U' CK_ULONG, 'V' version
+    std::string (*got)(const Result&);
+};
+// clang-format off
+#define INFO(command, S, res, member, kind, field)                                   \
+    InfoField{command, #member, sizeof(S), offsetof(S, member), kind,                 \
+              [](const Result& r) { return str(r.res().field()); }}
+#define TOKEN(member, kind, field) \
+    INFO("C_GetTokenInfo", CK_TOKEN_INFO, tokeninfores().pinfo, member, kind, field)
+const InfoField kInfoFields[] = {
+    INFO("C_GetInfo", CK_INFO, infores().ckinfo, cryptokiVersion, 'V', cryptokiversion),
+    INFO("C_GetInfo", CK_INFO, infores().ckinfo, manufacturerID, 'T', manufacturerid),
+    INFO("C_GetInfo", CK_INFO, infores().ckinfo, flags, 'U', flags),
+    INFO("C_GetInfo", CK_INFO, infores().ckinfo, libraryDescription, 'T', librarydescription),
+    INFO("C_GetInfo", CK_INFO, infores().ckinfo, libraryVersion, 'V', libraryversion),
+    INFO("C_GetSlotInfo", CK_SLOT_INFO, slotinfores().pinfo, slotDescription, 'T', slotdescription),
+    INFO("C_GetSlotInfo", CK_SLOT_INFO, slotinfores().pinfo, manufacturerID, 'T', manufacturerid),
+    INFO("C_GetSlotInfo", CK_SLOT_INFO, slotinfores().pinfo, flags, 'U', flags),
+    INFO("C_GetSlotInfo", CK_SLOT_INFO, slotinfores().pinfo, hardwareVersion, 'V', hardwareversion),
+    INFO("C_GetSlotInfo", CK_SLOT_INFO, slotinfores().pinfo, firmwareVersion, 'V', firmwareversion),
+    TOKEN(label, 'T', label), TOKEN(manufacturerID, 'T', manufacturerid), TOKEN(model, 'T', model),
+    TOKEN(serialNumber, 'T', serialnumber), TOKEN(flags, 'U', flags),
+    TOKEN(ulMaxSessionCount, 'U', ulmaxsessioncount), TOKEN(ulSessionCount, 'U', ulsessioncount),
+    TOKEN(ulMaxRwSessionCount, 'U', ulmaxrwsessioncount),
+    TOKEN(ulRwSessionCount, 'U', ulrwsessioncount), TOKEN(ulMaxPinLen, 'U', ulmaxpinlen),
+    TOKEN(ulMinPinLen, 'U', ulminpinlen), TOKEN(ulTotalPublicMemory, 'U', ultotalpublicmemory),
+    TOKEN(ulFreePublicMemory, 'U', ulfreepublicmemory),
+    TOKEN(ulTotalPrivateMemory, 'U', ultotalprivatememory),
+    TOKEN(ulFreePrivateMemory, 'U', ulfreeprivatememory),
+    TOKEN(hardwareVersion, 'V', hardwareversion), TOKEN(firmwareVersion, 'V', firmwareversion),
+    TOKEN(utcTime, 'T', utctime),
+    INFO("C_GetSessionInfo", CK_SESSION_INFO, sessioninfores().pinfo, slotID, 'U', slotid),
+    INFO("C_GetSessionInfo", CK_SESSION_INFO, sessioninfores().pinfo, state, 'U', state),
+    INFO("C_GetSessionInfo", CK_SESSION_INFO, sessioninfores().pinfo, flags, 'U', flags),
+    INFO("C_GetSessionInfo", CK_SESSION_INFO, sessioninfores().pinfo, ulDeviceError, 'U', uldeviceerror),
+    INFO("C_GetMechanismInfo", CK_MECHANISM_INFO, mechanisminfores().pinfo, ulMinKeySize, 'U', ulminkeysize),
+    INFO("C_GetMechanismInfo", CK_MECHANISM_INFO, mechanisminfores().pinfo, ulMaxKeySize, 'U', ulmaxkeysize),
+    INFO("C_GetMechanismInfo", CK_MECHANISM_INFO, mechanisminfores().pinfo, flags, 'U', flags),
+};
+#undef TOKEN
+#undef INFO
+// clang-format on
+
+TEST_F(PreparedToken, EveryInfoFieldComesBackFromItsOwnPlace) {
+    static CK_FUNCTION_LIST patched;
+    patched = *module_;
+    patched.C_GetInfo = [](CK_INFO_PTR out) { return fillPattern(out); };
+    patched.C_GetSlotInfo = [](CK_SLOT_ID, CK_SLOT_INFO_PTR out) { return fillPattern(out); };
+    patched.C_GetTokenInfo = [](CK_SLOT_ID, CK_TOKEN_INFO_PTR out) { return fillPattern(out); };
+    patched.C_GetSessionInfo = [](CK_SESSION_HANDLE, CK_SESSION_INFO_PTR out) {
+        return fillPattern(out);
+    };
+    patched.C_GetMechanismInfo = [](CK_SLOT_ID, CK_MECHANISM_TYPE, CK_MECHANISM_INFO_PTR out) {
+        return fillPattern(out);
     };
     ckpFunctions = &patched;
-    const Result res = parsed(C_GetTokenInfo_Server(requestBytes("C_GetTokenInfo")));
-    const pkcs11::CK_TOKEN_INFO& info = res.tokeninfores().pinfo();
-    EXPECT_EQ(std::string(sizeof(CK_TOKEN_INFO), 'A'), info.label());
-    EXPECT_EQ(std::string(sizeof(CK_TOKEN_INFO) - offsetof(CK_TOKEN_INFO, serialNumber), 'A'),
-              info.serialnumber());
-    EXPECT_EQ(std::string(16, 'A'), info.utctime());
-    EXPECT_EQ(0x4141414141414141u, info.ulfreeprivatememory());
+    for (const InfoField& f : kInfoFields) {
+        std::string bytes(f.size, '\0');
+        for (size_t i = 0; i < f.size; ++i) bytes[i] = patternAt(i);
+        std::string expected = bytes.substr(f.offset);
+        if (f.kind == 'U') {
+            CK_ULONG number = 0;
+            memcpy(&number, &bytes[f.offset], sizeof number);
+            expected = std::to_string(number);
+        } else if (f.kind == 'V') {
+            expected = std::to_string(bytes[f.offset]) + "." + std::to_string(bytes[f.offset + 1]);
+        }
+        const Result res = parsed(frameOf(f.command).handler(requestBytes(f.command)));
+        EXPECT_EQ(expected, f.got(res)) << f.command << " " << f.member;
+    }
 }
 
 TEST_F(PreparedToken, OpenSessionLogsTheHandleUnderItsOwnTag) {
