@@ -25,10 +25,6 @@ public:
         return *this;
     }
     Template& ulong(CK_ATTRIBUTE_TYPE type, CK_ULONG v) { return add(type, &v, sizeof v); }
-    Template& flag(CK_ATTRIBUTE_TYPE type, bool v) {
-        const CK_BBOOL b = v ? CK_TRUE : CK_FALSE;
-        return add(type, &b, sizeof b);
-    }
     Template& text(CK_ATTRIBUTE_TYPE type, const std::string& v) {
         return add(type, v.data(), v.size());
     }
@@ -50,14 +46,11 @@ public:
     void SetUp() override {
         fake_vendor_reset();
         ASSERT_EQ(f->C_Initialize(nullptr), CKR_OK);
-        session = open(CKF_SERIAL_SESSION | CKF_RW_SESSION);
+        ASSERT_EQ(f->C_OpenSession(FAKE_VENDOR_SLOT_ID, CKF_SERIAL_SESSION | CKF_RW_SESSION,
+                                   nullptr, nullptr, &session),
+                  CKR_OK);
     }
 
-    CK_SESSION_HANDLE open(CK_FLAGS flags) {
-        CK_SESSION_HANDLE h = CK_INVALID_HANDLE;
-        EXPECT_EQ(f->C_OpenSession(FAKE_VENDOR_SLOT_ID, flags, nullptr, nullptr, &h), CKR_OK);
-        return h;
-    }
 
     CK_OBJECT_HANDLE create(Template& t) {
         CK_OBJECT_HANDLE h = CK_INVALID_HANDLE;
@@ -65,15 +58,12 @@ public:
         return h;
     }
 
-    CK_OBJECT_HANDLE secretKey(CK_KEY_TYPE type, const Bytes& value, bool sensitive = false) {
+    CK_OBJECT_HANDLE aesKey() {
         Template t;
-        t.ulong(CKA_CLASS, CKO_SECRET_KEY)
-            .ulong(CKA_KEY_TYPE, type)
-            .add(CKA_VALUE, value.data(), value.size());
-        t.flag(CKA_SENSITIVE, sensitive).text(CKA_LABEL, "label");
+        t.ulong(CKA_CLASS, CKO_SECRET_KEY).ulong(CKA_KEY_TYPE, CKK_AES);
+        t.add(CKA_VALUE, aesValue.data(), aesValue.size());
         return create(t);
     }
-    CK_OBJECT_HANDLE aesKey() { return secretKey(CKK_AES, aesValue); }
 };
 
 inline CK_MECHANISM mechanism(CK_MECHANISM_TYPE type) { return {type, nullptr, 0}; }
