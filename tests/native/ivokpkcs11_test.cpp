@@ -11,6 +11,8 @@
 #include <iterator>
 #include <memory>
 #include <string>
+#include <type_traits>
+#include <utility>
 #include <vector>
 
 #include "fake_vendor.h"
@@ -130,56 +132,83 @@ TEST_F(NativeInterfaceTest, ResultLogFormatsFollowTheMethodGroup) {
     }
 }
 
-// Arguments and pointers reach the module as the caller gave them.
-TEST_F(NativeInterfaceTest, ArgumentsReachTheModuleUnchanged) {
-    connect("token-e");
-    auto token = instance("token-e");
-    ASSERT_EQ(token->C_Initialize(nullptr), CKR_OK);
+// Every forwarder hands its own module function each argument unchanged and
+// returns what it returned: a list of recorders, one per function, each
+// keeping its index and arguments; argument k of a call is a value no other
+// argument of that call has.
+struct Recorded {
+    size_t index = 0;
+    std::vector<uint64_t> args;
+} gRecorded;
 
-    CK_ULONG count = 0;
-    EXPECT_EQ(token->C_GetSlotList(CK_TRUE, nullptr, &count), CKR_OK);
-    EXPECT_EQ(count, 1u);
+template <class T>
+uint64_t asNumber(T value) {
+    if constexpr (std::is_pointer_v<T>)
+        return reinterpret_cast<uintptr_t>(value);
+    else
+        return static_cast<uint64_t>(value);
+}
+template <class T>
+T distinct(size_t index, size_t k) {
+    const uint64_t value = (index << 8) | (k + 1);
+    if constexpr (std::is_pointer_v<T>)
+        return reinterpret_cast<T>(static_cast<uintptr_t>(value));
+    else
+        return static_cast<T>(value);
+}
 
-    CK_SESSION_HANDLE session = 0;
-    ASSERT_EQ(token->C_OpenSession(FAKE_VENDOR_SLOT_ID, CKF_SERIAL_SESSION | CKF_RW_SESSION,
-                                   nullptr, nullptr, &session),
-              CKR_OK);
-    CK_UTF8CHAR pin[] = FAKE_VENDOR_USER_PIN;
-    ASSERT_EQ(token->C_Login(session, CKU_USER, pin, 4), CKR_OK);
-    fakevendor::Call login = fakevendor::lastCall("C_Login");
-    EXPECT_EQ(login.arg("hSession").number, session);
-    EXPECT_EQ(login.arg("userType").number, CKU_USER);
-    EXPECT_EQ(login.arg("pPin").hex, fakevendor::hex(pin, 4));
-    EXPECT_EQ(login.arg("ulPinLen").number, 4u);
+template <size_t Index, class Entry>
+struct Recorder;
+template <size_t Index, class... Args>
+struct Recorder<Index, CK_RV (*)(Args...)> {
+    static CK_RV record(Args... args) {
+        gRecorded = {Index, {asNumber(args)...}};
+        return 0x80000000UL + Index;
+    }
+};
 
-    CK_OBJECT_CLASS cls = CKO_SECRET_KEY;
-    CK_KEY_TYPE type = CKK_AES;
-    CK_BYTE value[16] = {0x11, 0x22};
-    CK_ATTRIBUTE tmpl[] = {{CKA_CLASS, &cls, sizeof(cls)},
-                           {CKA_KEY_TYPE, &type, sizeof(type)},
-                           {CKA_VALUE, value, sizeof(value)}};
-    CK_OBJECT_HANDLE key = 0;
-    ASSERT_EQ(token->C_CreateObject(session, tmpl, 3, &key), CKR_OK);
-    fakevendor::Call create = fakevendor::lastCall("C_CreateObject");
-    ASSERT_EQ(create.arg("pTemplate").items.size(), 3u);
-    EXPECT_EQ(create.arg("pTemplate").items[2].hex, fakevendor::hex(value, sizeof(value)));
-    EXPECT_EQ(create.arg("ulCount").number, 3u);
+template <class... Args, size_t... K>
+std::vector<uint64_t> callWithDistinct(IVokPkcs11* token, CK_RV (IVokPkcs11::*method)(Args...),
+                                       size_t index, CK_RV* rv, std::index_sequence<K...>) {
+    *rv = (token->*method)(distinct<Args>(index, K)...);
+    return {asNumber(distinct<Args>(index, K))...};
+}
+template <class... Args>
+std::vector<uint64_t> callWithDistinct(IVokPkcs11* token, CK_RV (IVokPkcs11::*method)(Args...),
+                                       size_t index, CK_RV* rv) {
+    return callWithDistinct(token, method, index, rv, std::index_sequence_for<Args...>());
+}
 
-    CK_MECHANISM mechanism = {CKM_AES_ECB, nullptr, 0};
-    ASSERT_EQ(token->C_EncryptInit(session, &mechanism, key), CKR_OK);
-    CK_BYTE plain[16] = {'a', 'b', 'c'};
-    CK_BYTE cipher[16];
-    CK_ULONG cipherLen = sizeof(cipher);
-    ASSERT_EQ(token->C_Encrypt(session, plain, sizeof(plain), cipher, &cipherLen), CKR_OK);
-    fakevendor::Call encrypt = fakevendor::lastCall("C_Encrypt");
-    EXPECT_EQ(encrypt.arg("pData").hex, fakevendor::hex(plain, sizeof(plain)));
-    EXPECT_EQ(encrypt.arg("pulEncryptedDataLen").number, sizeof(cipher));
-    EXPECT_EQ(cipherLen, sizeof(plain));
-    EXPECT_EQ(cipher[0], plain[0] ^ value[0]);  // written straight into the caller's buffer
-
-    CK_BYTE random[8] = {};
-    ASSERT_EQ(token->C_GenerateRandom(session, random, sizeof(random)), CKR_OK);
-    EXPECT_EQ(fakevendor::lastCall("C_GenerateRandom").arg("ulRandomLen").number, 8u);
+TEST_F(NativeInterfaceTest, EveryForwarderHandsItsOwnFunctionTheArgumentsUnchanged) {
+    struct Row {
+        const char* name;
+        size_t index;
+        std::function<std::vector<uint64_t>(IVokPkcs11*, CK_RV*)> call;
+    };
+    static CK_FUNCTION_LIST list;  // registered: outlives the test
+    std::vector<Row> rows;
+#define VOK_INDEX(name) \
+    ((offsetof(CK_FUNCTION_LIST, name) - offsetof(CK_FUNCTION_LIST, C_Initialize)) / sizeof(void*))
+#define VOK_ROW(name, params)                                                             \
+    list.name = &Recorder<VOK_INDEX(name), decltype(list.name)>::record;                  \
+    rows.push_back({#name, VOK_INDEX(name), [](IVokPkcs11* token, CK_RV* rv) {            \
+                        return callWithDistinct(token, &IVokPkcs11::name, VOK_INDEX(name), rv); \
+                    }});
+    VOK_CK_FUNCTIONS(VOK_ROW)
+#undef VOK_ROW
+#undef VOK_INDEX
+    voktest::registerModule("recorders", &list);
+    auto token = instance("recorders");
+    for (const Row& row : rows) {
+        if (std::string(row.name) == "C_GetFunctionList") continue;  // not offered
+        SCOPED_TRACE(row.name);
+        gRecorded = {};
+        CK_RV rv = 0;
+        const std::vector<uint64_t> sent = row.call(token.get(), &rv);
+        EXPECT_EQ(gRecorded.index, row.index);
+        EXPECT_EQ(gRecorded.args, sent);
+        EXPECT_EQ(rv, 0x80000000UL + row.index);
+    }
 }
 
 // Every argument zero or NULL: the calls below never reach a module.
