@@ -27,6 +27,22 @@ bool moduleLoaded() {
     return handle != nullptr;
 }
 
+// The slot event is signalled from inside the module, and the call it ends
+// may unload the module at once: the test holds the module mapped until the
+// signal has returned and the call has been answered.
+class Mapped {
+public:
+    Mapped() : handle_(dlopen(VOK_FAKE_VENDOR_LIBRARY, RTLD_NOW | RTLD_NOLOAD)) {}
+    ~Mapped() { release(); }
+    void release() {
+        if (handle_ != nullptr) dlclose(handle_);
+        handle_ = nullptr;
+    }
+
+private:
+    void* handle_;
+};
+
 template <class F>
 F moduleFunction(const char* name) {
     void* handle = dlopen(VOK_FAKE_VENDOR_LIBRARY, RTLD_NOW | RTLD_NOLOAD);
@@ -75,8 +91,10 @@ TEST_F(DisconnectRace, TheModuleStaysLoadedUntilTheCallInsideItReturns) {
 
     Java_com_vok_smartcard_pkcs11_Pkcs11_disconnect(env_, self);
     EXPECT_TRUE(moduleLoaded()) << "unloaded under the running call";
+    Mapped mapped;
     signal();
     ASSERT_TRUE(client.recvFrame(&header, &payload));
+    mapped.release();
     pkcs11::OperationResult answer;
     ASSERT_TRUE(answer.ParseFromArray(payload.data(), static_cast<int>(payload.size())));
     EXPECT_EQ("C_WaitForSlotEvent", answer.name());
@@ -108,8 +126,10 @@ TEST_F(DisconnectRace, AJavaCallKeepsTheModuleLoadedUntilItReturns) {
     // Unloading under the call hangs here or crashes; a test that got past
     // that without the module could not join the caller.
     ASSERT_TRUE(moduleLoaded()) << "unloaded under the running call";
+    Mapped mapped;
     signal();
     caller.join();
+    mapped.release();
     EXPECT_TRUE(voktest::waitUntil([] { return !moduleLoaded(); })) << "never unloaded";
 }
 
