@@ -6,6 +6,7 @@
 
 #include <atomic>
 #include <cstddef>
+#include <algorithm>
 #include <cstdint>
 #include <cstdlib>
 #include <cstring>
@@ -413,10 +414,17 @@ TEST_F(Dispatcher, NothingOfARequestStaysAllocatedAfterItsAnswer) {
     const std::string request = emptyAttributes(10000);
     dispatch(requestBytes("C_GetInfo"));
     fake_vendor_reset();  // what the module keeps (records, objects) is not the service's
+    // The Java VM's threads allocate beside the test: the least growth over a
+    // few rounds is the requests'; a leak grows with every round.
     const size_t before = allocatedBytes();
-    EXPECT_EQ("C_CreateObject", parsed(dispatch(request)).name());
-    fake_vendor_reset();
-    EXPECT_LT(allocatedBytes(), before + 16 * 1024);
+    size_t least = SIZE_MAX;
+    for (int round = 0; round < 5; ++round) {
+        EXPECT_EQ("C_CreateObject", parsed(dispatch(request)).name());
+        fake_vendor_reset();
+        const size_t now = allocatedBytes();
+        least = std::min(least, now > before ? now - before : 0);
+    }
+    EXPECT_LT(least, 16u * 1024);
 }
 
 // The documented bound: about 16 times the request's size plus 70 MiB.
