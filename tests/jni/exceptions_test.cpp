@@ -42,10 +42,13 @@ TEST_F(ExceptionHelpers, EachHelperThrowsItsClassAndMessage) {
         const char* message;  // null: getMessage() answers null
         jlong errorCode = 0;  // of a PKCS11Exception
     } cases[] = {
-        {"PIN incorrect", notOk(CKR_PIN_INCORRECT), kPkcs11Exception, nullptr, 0xA0},
-        {"buffer too small", notOk(CKR_BUFFER_TOO_SMALL), kPkcs11Exception, nullptr, 0x150},
-        {"vendor defined", notOk(CKR_VENDOR_DEFINED), kPkcs11Exception, nullptr, 0x80000000},
-        {"all ones", notOk(0xFFFFFFFFFFFFFFFFull), kPkcs11Exception, nullptr, -1},
+        {"PIN incorrect", notOk(CKR_PIN_INCORRECT), kPkcs11Exception, "CKR 0x00000000000000A0",
+         0xA0},
+        {"buffer too small", notOk(CKR_BUFFER_TOO_SMALL), kPkcs11Exception,
+         "CKR 0x0000000000000150", 0x150},
+        {"vendor defined", notOk(CKR_VENDOR_DEFINED), kPkcs11Exception, "CKR 0x0000000080000000",
+         0x80000000},
+        {"all ones", notOk(0xFFFFFFFFFFFFFFFFull), kPkcs11Exception, "CKR 0xFFFFFFFFFFFFFFFF", -1},
         {"disconnected", throwDisconnectedRuntimeException, kRuntimeException,
          "This object is not connected to a module."},
         {"runtime with message",
