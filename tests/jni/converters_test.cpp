@@ -8,6 +8,7 @@
 // against it member by member.
 #include "converters.h"
 
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <csignal>
@@ -405,6 +406,7 @@ void checkJavaValues(JNIEnv* env, jobject object, const std::vector<Member>& mem
 }
 
 
+using ::testing::ElementsAre;
 using voktest::takePendingException;
 
 const std::string kTag = "[native jni pkcs11wrapper]";
@@ -761,6 +763,29 @@ TEST_F(Converters, InitArgsAdapterCarriesFlagsAndReservedValue) {
     EXPECT_EQ(nativeBytes(native->pReserved, 8), le64(0x1234));
     freeCKInitArgsAdapter(native);
     EXPECT_EQ(tracked.live(), 0u);
+}
+
+TEST_F(Converters, TemplateConversionLogsEachStep) {
+    voktest::LogCapture log;
+    jobjectArray array =
+        attributes(env_, {attribute(env_, CKA_ID, newBytes(env_, {'I', 'D'}))});
+    CK_ATTRIBUTE_PTR out = nullptr;
+    CK_ULONG count = 0;
+    ASSERT_EQ(jAttributeArrayToCKAttributeArray(env_, array, &out, &count), 0);
+    auto texts = log.texts(kTag);
+    ASSERT_EQ(texts.size(), 21u);
+    texts[10] = texts[10].substr(0, 11);  // the object's address varies
+    EXPECT_THAT(
+        texts,
+        ElementsAre(
+            "jAttributeArrayToCKAttributeArray", "\nDEBUG: jAttributeArrayToCKAttributeArray",
+            ", converting 1 attributes", ", getting 0. attribute", ", converting 0. attribute",
+            "\nDEBUG: jAttributeToCKAttribute", ", getting attribute object class",
+            ", getting type field", ", type=0x102", ", getting pValue field", ", pValue=0x",
+            ", converting pValue to primitive object", "\nDEBUG: jObjectToPrimitiveCKObjectPtrPtr",
+            "ckpLength:2", "<Byte value ID>", "ckpLength: 2", "FINISHED\n", "\nFINISHED\n",
+            "FINISHED\n", "\nConverted template with following types: ", "\n"));
+    freeCKAttributeArray(out, count);
 }
 
 TEST(ConverterAliases, SecondNamesAreTheSameFunctions) {
