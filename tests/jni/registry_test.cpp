@@ -6,6 +6,8 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <algorithm>
+#include <atomic>
 #include <cstdlib>
 #include <memory>
 #include <string>
@@ -20,21 +22,25 @@ namespace {
 using ::testing::ElementsAre;
 using ::testing::ElementsAreArray;
 using voktest::LogCapture;
-using voktest::LogLine;
 using voktest::Module;
 
 const std::string kTag = "[native jni pkcs11wrapper]";
-constexpr int kDebug = 3;
-constexpr int kError = 6;
-const char* const kNoEnvLine =
-    "callback_handler: failed to get JNI environment, assuming native thread";
-const char* const kNoAttachLine = "callback_handler: failed to attach current thread";
+const std::string kNoEnv =
+    "6:callback_handler: failed to get JNI environment, assuming native thread|";
+const std::string kNoAttach = "6:callback_handler: failed to attach current thread|";
+const std::string kMissing =
+    "3:the entry is not in the list|3:failed getting module entry|3:failed getting module entry|";
 
 // Only their addresses matter.
 CK_FUNCTION_LIST gListA{}, gListB{}, gListC{}, gListD{};
 
-LogLine debug(const std::string& text) { return {kTag, kDebug, text}; }
-LogLine error(const std::string& text) { return {kTag, kError, text}; }
+// The registry's lines, each as "<priority>:<text>|".
+std::string logged(const LogCapture& log) {
+    std::string all;
+    for (const auto& line : log.lines())
+        if (line.tag == kTag) all += std::to_string(line.priority) + ":" + line.text + "|";
+    return all;
+}
 
 std::vector<ModuleEntry*> listedEntries() {
     std::vector<ModuleEntry*> entries;
@@ -67,33 +73,25 @@ TEST_F(Registry, OnLoadStoresTheVmAndAnswersJni12) {
     gJavaVM = nullptr;
     EXPECT_EQ(JNI_OnLoad(voktest::javaVM(), nullptr), 0x10002);
     EXPECT_EQ(gJavaVM, voktest::javaVM());
-    EXPECT_THAT(log.lines(),
-                ElementsAre(debug("jni_onload : QUORVEL PKCS11Wrapper version : 2.4")));
+    EXPECT_EQ(logged(log), "3:jni_onload : QUORVEL PKCS11Wrapper version : 2.4|");
 }
 
 TEST_F(Registry, EqualsIsIdentityWhateverTheClassSays) {
     jobject object = voktest::newKey();
-    jobject sameObject = env_->NewGlobalRef(object);
     jobject other = voktest::newKey();
     jstring text = env_->NewStringUTF("same text");
     jstring equalText = env_->NewStringUTF("same text");
-    jclass stringClass = env_->FindClass("java/lang/String");
-    jmethodID stringEquals = env_->GetMethodID(stringClass, "equals", "(Ljava/lang/Object;)Z");
-    ASSERT_TRUE(env_->CallBooleanMethod(text, stringEquals, equalText))
-        << "String.equals should hold";
-    ASSERT_FALSE(env_->ExceptionCheck());
-
     struct {
         const char* what;
-        jobject first;
-        jobject second;
+        jobject first, second;
         int expected;
     } cases[] = {
         {"both null", nullptr, nullptr, 1},
         {"first null", nullptr, object, 0},
         {"second null", object, nullptr, 0},
-        {"two references to one object", object, sameObject, 1},
+        {"two references to one object", object, env_->NewGlobalRef(object), 1},
         {"distinct objects", object, other, 0},
+        // String.equals would call them equal.
         {"equal strings, distinct objects", text, equalText, 0},
     };
     for (const auto& c : cases) EXPECT_EQ(equals(env_, c.first, c.second), c.expected) << c.what;
@@ -113,85 +111,65 @@ TEST_F(Registry, SameObjectUnderTwoReferencesReplacesTheEntry) {
     freeEntry(older);  // handed back to its owner by the replace
 }
 
-TEST_F(Registry, LookupByObjectLogsWhatItFound) {
+// By object, and by name: a name matches whole and never an entry without
+// one; no name means the first module.
+TEST_F(Registry, LookupsByObjectAndByNameAndWhatTheyLog) {
+    {
+        LogCapture log;
+        EXPECT_EQ(getFunctionsByModule(nullptr), nullptr) << "empty registry";
+        EXPECT_EQ(logged(log),
+                  "3: getFunctionsByModule|3:module name passed NULL|3:failed getting module "
+                  "entry|3:failed getting module entry|");
+    }
     Module alpha = add("alpha", &gListA);
     Module unnamed = add(nullptr, &gListB);
+    Module nolist = add("nolist", nullptr);
     Module tail = add("tail", &gListC);
-    jobject stranger = voktest::newKey();
-
     struct {
         const char* what;
         jobject object;
         ModuleEntry* expected;
-        std::vector<LogLine> lines;
-    } cases[] = {
-        {"head", alpha.object, alpha.entry, {debug("found the entry"), debug("module name alpha")}},
-        {"unnamed",
-         unnamed.object,
-         unnamed.entry,
-         {debug("found the entry"), debug("module name (null)")}},
-        {"tail", tail.object, tail.entry, {debug("found the entry"), debug("module name tail")}},
-        {"stranger", stranger, nullptr, {debug("the entry is not in the list")}},
-        {"null object", nullptr, nullptr, {}},
+        std::string lines;
+    } byObject[] = {
+        {"head", alpha.object, alpha.entry, "3:found the entry|3:module name alpha|"},
+        {"unnamed", unnamed.object, unnamed.entry, "3:found the entry|3:module name (null)|"},
+        {"tail", tail.object, tail.entry, "3:found the entry|3:module name tail|"},
+        {"stranger", voktest::newKey(), nullptr, "3:the entry is not in the list|"},
+        {"null object", nullptr, nullptr, ""},
     };
-    for (const auto& c : cases) {
+    for (const auto& c : byObject) {
         LogCapture log;
         EXPECT_EQ(getModuleEntry(env_, c.object), c.expected) << c.what;
         EXPECT_EQ(isModulePresent(env_, c.object), c.expected != nullptr ? 1 : 0) << c.what;
-        std::vector<LogLine> twice = c.lines;  // isModulePresent logs the same again
-        twice.insert(twice.end(), c.lines.begin(), c.lines.end());
-        EXPECT_EQ(log.lines(), twice) << c.what;
+        EXPECT_EQ(logged(log), c.lines + c.lines) << c.what;  // isModulePresent logs again
+        if (c.expected == nullptr) {
+            EXPECT_EQ(removeModuleEntry(env_, c.object), nullptr) << c.what;
+        }
     }
-}
+    EXPECT_THAT(listedEntries(), ElementsAre(alpha.entry, unnamed.entry, nolist.entry, tail.entry));
 
-// A name matches whole and never an entry without one; no name means the
-// first module.
-TEST_F(Registry, FunctionsByModuleName) {
-    {
-        LogCapture log;
-        EXPECT_EQ(getFunctionsByModule(nullptr), nullptr) << "empty registry";
-        EXPECT_THAT(log.lines(), ElementsAre(debug(" getFunctionsByModule"),
-                                             debug("module name passed NULL"),
-                                             debug("failed getting module entry"),
-                                             debug("failed getting module entry")));
-    }
-    add("alpha", &gListA);
-    add("gamma", &gListC);
-    add("nolist", nullptr);
-    add(nullptr, &gListB);  // an unnamed tail
-
-    const std::vector<std::string> missing = {"the entry is not in the list",
-                                              "failed getting module entry",
-                                              "failed getting module entry"};
     struct {
         const char* name;
         CK_FUNCTION_LIST_PTR expected;
-        std::vector<std::string> lines;  // after the call's and the name's lines
-    } cases[] = {
-        {"alpha", &gListA, {"found the entry"}},
-        {"gamma", &gListC, {"found the entry"}},
-        {nullptr, &gListA, {"found default entry"}},
-        {"nolist", nullptr, {"found the entry", "ckpFunctions is null getFunctionsByModule"}},
-        {"missing", nullptr, missing},
-        {"", nullptr, missing},
-        {"alph", nullptr, missing},
+        std::string lines;  // after the call's and the name's lines
+    } byName[] = {
+        {"alpha", &gListA, "3:found the entry|"},
+        {"tail", &gListC, "3:found the entry|"},
+        {nullptr, &gListA, "3:found default entry|"},
+        {"nolist", nullptr, "3:found the entry|3:ckpFunctions is null getFunctionsByModule|"},
+        {"missing", nullptr, kMissing},
+        {"", nullptr, kMissing},
+        {"alph", nullptr, kMissing},
     };
-    for (const auto& c : cases) {
+    for (const auto& c : byName) {
         const std::string shown = c.name != nullptr ? c.name : "NULL";
-        std::vector<LogLine> expected = {debug(" getFunctionsByModule"),
-                                         debug("module name passed " + shown)};
-        for (const auto& line : c.lines) expected.push_back(debug(line));
         LogCapture log;
         EXPECT_EQ(getFunctionsByModule(c.name), c.expected) << shown;
-        EXPECT_EQ(log.lines(), expected) << shown;
+        EXPECT_EQ(logged(log), "3: getFunctionsByModule|3:module name passed " + shown + "|" + c.lines)
+            << shown;
     }
-}
-
-TEST_F(Registry, DefaultModuleIsTheFirstConnectedStill) {
-    Module first = add("first", &gListA);
-    add("second", &gListB);
-    EXPECT_EQ(getFunctionsByModule(nullptr), &gListA);
-    freeEntry(removeModuleEntry(env_, first.object));
+    // The default is the first module still connected.
+    freeEntry(removeModuleEntry(env_, alpha.object));
     EXPECT_EQ(getFunctionsByModule(nullptr), &gListB);
 }
 
@@ -221,71 +199,58 @@ TEST_F(Registry, RemoveUnlinksHeadMiddleAndTail) {
     }
 }
 
-TEST_F(Registry, RemovingAnUnknownObjectChangesNothing) {
+// Remove-all keeps the lock; finalize deletes it, and without it every
+// registry function does nothing until the library is initialised again.
+TEST_F(Registry, RemoveAllKeepsTheLockAndFinalizeDeletesIt) {
     Module a = add("a", &gListA);
     Module b = add("b", &gListB);
-    jobject stranger = voktest::newKey();
-    EXPECT_EQ(removeModuleEntry(env_, stranger), nullptr);
-    EXPECT_EQ(removeModuleEntry(env_, nullptr), nullptr);
-    EXPECT_THAT(listedEntries(), ElementsAre(a.entry, b.entry));
-}
-
-TEST_F(Registry, RemoveAllKeepsTheLockAndTheEntries) {
-    Module a = add("a", &gListA);
-    Module b = add("b", &gListB);
-    jobject lock = moduleListLock;
+    const jobject lock = moduleListLock;
     removeAllModuleEntries(env_);
     EXPECT_EQ(moduleListHead, nullptr);
     EXPECT_EQ(moduleListLock, lock);
     EXPECT_EQ(a.entry->functionList, &gListA);  // abandoned, not freed
     EXPECT_EQ(b.entry->functionList, &gListB);
-
     Module c = add("c", &gListC);
     EXPECT_THAT(listedEntries(), ElementsAre(c.entry));
-    freeEntry(a.entry);
-    freeEntry(b.entry);
-}
 
-// Without the lock every registry function does nothing.
-TEST_F(Registry, FinalizeAfterEveryNodeWasRemovedDeletesTheLock) {
-    Module a = add("a", &gListA);
-    Module b = add("b", &gListB);
-    freeEntry(removeModuleEntry(env_, a.object));
-    freeEntry(removeModuleEntry(env_, b.object));
     finalize();
+    EXPECT_EQ(moduleListHead, nullptr);
     EXPECT_EQ(moduleListLock, nullptr);
-
-    EXPECT_EQ(getModuleEntry(env_, a.object), nullptr);
-    EXPECT_EQ(isModulePresent(env_, b.object), 0);
-    EXPECT_EQ(getModuleEntryByName("a"), nullptr);
+    finalize();  // a second one finds nothing to do
+    EXPECT_EQ(moduleListLock, nullptr);
+    EXPECT_EQ(getModuleEntry(env_, c.object), nullptr);
+    EXPECT_EQ(isModulePresent(env_, c.object), 0);
     EXPECT_EQ(getFunctionsByModule(nullptr), nullptr);
-    EXPECT_EQ(removeModuleEntry(env_, a.object), nullptr);
+    EXPECT_EQ(removeModuleEntry(env_, c.object), nullptr);
     jobject key = voktest::newKey();
     ModuleEntry entry{};
     putModuleEntry(env_, key, &entry);
     EXPECT_EQ(moduleListHead, nullptr);
     removeAllModuleEntries(env_);
     env_->DeleteGlobalRef(key);  // not taken over
+    for (ModuleEntry* abandoned : {a.entry, b.entry, c.entry}) freeEntry(abandoned);
 
-    // Until the library is initialised again; a second initialisation keeps the lock.
-    voktest::initializeLibrary();
-    const jobject lock = moduleListLock;
-    ASSERT_NE(lock, nullptr);
-    voktest::initializeLibrary();
-    EXPECT_EQ(moduleListLock, lock);
-    Module c = add("c", &gListC);
-    EXPECT_EQ(getModuleEntry(env_, c.object), c.entry);
-}
+    // A native thread's lookup then finds nothing and leaves the thread attached.
+    LogCapture log;
+    ModuleEntry* found = &entry;
+    jint after = JNI_EDETACHED;
+    std::thread([&] {
+        found = getModuleEntryByName("c");
+        after = envState();
+        if (after == JNI_OK) voktest::javaVM()->DetachCurrentThread();
+    }).join();
+    EXPECT_EQ(found, nullptr);
+    EXPECT_EQ(after, JNI_OK);
+    EXPECT_EQ(logged(log), "3:module name passed c|" + kNoEnv);
 
-TEST_F(Registry, FinalizeEmptiesAFilledRegistryToo) {
-    Module a = add("a", &gListA);
-    finalize();
-    EXPECT_EQ(moduleListHead, nullptr);
-    EXPECT_EQ(moduleListLock, nullptr);
-    EXPECT_EQ(getModuleEntry(env_, a.object), nullptr);
-    finalize();  // a second one finds nothing to do
-    EXPECT_EQ(moduleListLock, nullptr);
-    freeEntry(a.entry);  // abandoned by finalize
+    // A second initialisation keeps the lock.
+    voktest::initializeLibrary();
+    const jobject again = moduleListLock;
+    ASSERT_NE(again, nullptr);
+    voktest::initializeLibrary();
+    EXPECT_EQ(moduleListLock, again);
+    Module d = add("d", &gListD);
+    EXPECT_EQ(getModuleEntry(env_, d.object), d.entry);
 }
 
 void* failingAlloc(std::size_t) { return nullptr; }
@@ -321,62 +286,6 @@ TEST_F(Registry, NodeAllocationFailureThrowsAndReleasesTheMonitor) {
     }
 }
 
-// A name lookup from a thread with no JNI environment attaches it for the
-// lookup only; a thread that has one keeps it.
-TEST_F(Registry, NameLookupFromThreadsWithAndWithoutJni) {
-    Module alpha = add("alpha", &gListA);
-    struct {
-        const char* what;
-        bool javaThread;
-        std::vector<LogLine> lines;
-    } cases[] = {
-        {"native thread",
-         false,
-         {debug(" getFunctionsByModule"), debug("module name passed alpha"), error(kNoEnvLine),
-          debug("found the entry")}},
-        {"attached thread",
-         true,
-         {debug(" getFunctionsByModule"), debug("module name passed alpha"),
-          debug("found the entry")}},
-    };
-    for (const auto& c : cases) {
-        LogCapture log;
-        CK_FUNCTION_LIST_PTR found = nullptr;
-        jint before = JNI_OK, after = JNI_OK;
-        std::thread([&] {
-            std::unique_ptr<voktest::AttachedThread> attached;
-            if (c.javaThread) attached = std::make_unique<voktest::AttachedThread>();
-            before = envState();
-            found = getFunctionsByModule("alpha");
-            after = envState();
-        }).join();
-        EXPECT_EQ(found, &gListA) << c.what;
-        EXPECT_EQ(before, c.javaThread ? JNI_OK : JNI_EDETACHED) << c.what;
-        EXPECT_EQ(after, before) << c.what;
-        EXPECT_EQ(log.lines(), c.lines) << c.what;
-    }
-    EXPECT_EQ(getModuleEntry(env_, alpha.object), alpha.entry);
-}
-
-TEST_F(Registry, NativeThreadStaysAttachedWhenTheLibraryIsNotInitialised) {
-    Module alpha = add("alpha", &gListA);
-    finalize();
-    freeEntry(alpha.entry);  // abandoned by finalize
-    LogCapture log;
-    ModuleEntry sentinel{};
-    ModuleEntry* found = &sentinel;
-    jint after = JNI_EDETACHED;
-    std::thread([&] {
-        found = getModuleEntryByName("alpha");
-        after = envState();
-        if (after == JNI_OK) voktest::javaVM()->DetachCurrentThread();
-    }).join();
-    EXPECT_EQ(found, nullptr);
-    EXPECT_EQ(after, JNI_OK);
-    EXPECT_TRUE(log.contains(kTag, kNoEnvLine));
-    EXPECT_FALSE(log.contains(kTag, kNoAttachLine));
-}
-
 bool currentThreadIsDaemon(JNIEnv* env) {
     jclass thread = env->FindClass("java/lang/Thread");
     jmethodID current = env->GetStaticMethodID(thread, "currentThread", "()Ljava/lang/Thread;");
@@ -386,34 +295,49 @@ bool currentThreadIsDaemon(JNIEnv* env) {
     return !env->ExceptionCheck() && daemon == JNI_TRUE;
 }
 
-// The server thread's way: attached once, as a daemon, it stays attached
-// through its lookups, which then find their environment without error lines.
-TEST_F(Registry, AThreadKeptAttachedIsADaemonThatLooksUpWithoutErrorLines) {
+// A thread with no JNI environment is attached for the lookup only, with an
+// error line; one that has an environment keeps it. The server thread's way:
+// attached once, as a daemon, it stays attached and looks up without error
+// lines.
+TEST_F(Registry, NameLookupsFromEveryKindOfThread) {
     add("alpha", &gListA);
-    LogCapture log;
-    int first = -1, again = -1;
-    bool daemon = false;
-    CK_FUNCTION_LIST_PTR found = nullptr;
-    jint after = JNI_EDETACHED;
-    std::thread([&] {
-        first = keepThreadAttachedToJavaVm();
-        again = keepThreadAttachedToJavaVm();
-        found = getFunctionsByModule("alpha");
-        after = envState();
-        if (after != JNI_OK) return;
-        daemon = currentThreadIsDaemon(voktest::currentEnv());
-        voktest::javaVM()->DetachCurrentThread();
-    }).join();
-    EXPECT_EQ(first, 1);
-    EXPECT_EQ(again, 1);
-    EXPECT_EQ(found, &gListA);
-    EXPECT_EQ(after, JNI_OK);
-    EXPECT_TRUE(daemon);
-    EXPECT_FALSE(log.contains(kTag, kNoEnvLine));
-}
+    enum How { Native, Attached, KeptAttached };
+    const std::string call = "3: getFunctionsByModule|3:module name passed alpha|";
+    struct {
+        const char* what;
+        How how;
+        std::string lines;
+    } cases[] = {
+        {"native thread", Native, call + kNoEnv + "3:found the entry|"},
+        {"attached thread", Attached, call + "3:found the entry|"},
+        {"kept attached", KeptAttached, call + "3:found the entry|"},
+    };
+    for (const auto& c : cases) {
+        LogCapture log;
+        CK_FUNCTION_LIST_PTR found = nullptr;
+        jint before = JNI_OK, after = JNI_OK;
+        int kept = 0;
+        bool daemon = false;
+        std::thread([&] {
+            std::unique_ptr<voktest::AttachedThread> attached;
+            if (c.how == Attached) attached = std::make_unique<voktest::AttachedThread>();
+            if (c.how == KeptAttached) kept = keepThreadAttachedToJavaVm() + keepThreadAttachedToJavaVm();
+            before = envState();
+            found = getFunctionsByModule("alpha");
+            after = envState();
+            if (c.how != KeptAttached || after != JNI_OK) return;
+            daemon = currentThreadIsDaemon(voktest::currentEnv());
+            voktest::javaVM()->DetachCurrentThread();
+        }).join();
+        EXPECT_EQ(found, &gListA) << c.what;
+        EXPECT_EQ(before, c.how == Native ? JNI_EDETACHED : JNI_OK) << c.what;
+        EXPECT_EQ(after, before) << c.what;
+        EXPECT_EQ(kept, c.how == KeptAttached ? 2 : 0) << c.what;
+        EXPECT_EQ(daemon, c.how == KeptAttached) << c.what;
+        EXPECT_EQ(logged(log), c.lines) << c.what;
+    }
 
-TEST_F(Registry, NameLookupWithoutAVmGivesUp) {
-    add("alpha", &gListA);
+    // Without a VM nothing is attached and nothing found.
     JavaVM* vm = gJavaVM;
     gJavaVM = nullptr;
     LogCapture log;
@@ -422,8 +346,63 @@ TEST_F(Registry, NameLookupWithoutAVmGivesUp) {
     gJavaVM = vm;
     EXPECT_EQ(found, nullptr);
     EXPECT_EQ(attached, 0);
-    EXPECT_THAT(log.lines(), ElementsAre(debug("module name passed alpha"), error(kNoEnvLine),
-                                         error(kNoAttachLine)));
+    EXPECT_EQ(logged(log), "3:module name passed alpha|" + kNoEnv + kNoAttach);
+}
+
+// Java threads connecting and disconnecting while native threads look
+// modules up by name: the monitor keeps the list whole, and every native
+// lookup leaves its thread detached.
+TEST_F(Registry, ListStaysWholeUnderMixedThreads) {
+    constexpr int kJavaThreads = 3, kRounds = 200, kKeepEvery = 10;
+    LogCapture log;  // keeps thousands of lines off the console
+    Module anchor = add("anchor", &gListA);
+    std::vector<std::vector<ModuleEntry*>> kept(kJavaThreads);
+    std::atomic<int> stillAttached{0};
+    std::vector<std::thread> threads;
+    for (int id = 0; id < kJavaThreads; ++id)
+        threads.emplace_back([&kept, id] {
+            voktest::AttachedThread thread;
+            JNIEnv* env = thread.env();
+            ASSERT_NE(env, nullptr);
+            for (int round = 0; round < kRounds; ++round) {
+                const std::string name = std::to_string(id) + "-" + std::to_string(round);
+                Module module = voktest::registerModule(name.c_str(), &gListB);
+                EXPECT_EQ(getModuleEntry(env, module.object), module.entry) << name;
+                EXPECT_EQ(getModuleEntryByName(name.c_str()), module.entry) << name;
+                if (round % kKeepEvery == 0) {
+                    kept[id].push_back(module.entry);
+                } else {
+                    EXPECT_EQ(removeModuleEntry(env, module.object), module.entry) << name;
+                    std::free(module.entry);
+                    EXPECT_EQ(getModuleEntryByName(name.c_str()), nullptr) << name;
+                }
+                env->DeleteGlobalRef(module.object);
+            }
+        });
+    for (int id = 0; id < 2; ++id)
+        threads.emplace_back([&stillAttached] {
+            for (int round = 0; round < kRounds; ++round) {
+                EXPECT_EQ(getFunctionsByModule("anchor"), &gListA);
+                EXPECT_EQ(getModuleEntryByName("absent"), nullptr);
+                if (envState() != JNI_EDETACHED) ++stillAttached;
+            }
+        });
+    for (auto& t : threads) t.join();
+
+    EXPECT_EQ(stillAttached.load(), 0);
+    EXPECT_FALSE(log.contains(kTag, "callback_handler: failed to attach current thread"));
+    // The anchor first; each worker's survivors once each, in that worker's order.
+    const std::vector<ModuleEntry*> listed = listedEntries();
+    ASSERT_EQ(listed.size(), 1u + kJavaThreads * (kRounds / kKeepEvery));
+    EXPECT_EQ(listed.front(), anchor.entry);
+    for (const auto& survivors : kept) {
+        auto from = listed.begin();
+        for (ModuleEntry* entry : survivors) {
+            from = std::find(from, listed.end(), entry);
+            ASSERT_NE(from, listed.end());
+            EXPECT_EQ(std::count(listed.begin(), listed.end(), entry), 1);
+        }
+    }
 }
 
 }  // namespace

@@ -1,5 +1,5 @@
-// IVokPkcs11 against the fake vendor module registered through the real
-// registry in an embedded Java VM.
+// IVokPkcs11 against modules registered through the real registry in an
+// embedded Java VM.
 #include "IVokPkcs11.h"
 
 #include <gtest/gtest.h>
@@ -8,7 +8,6 @@
 #include <cstdlib>
 #include <cstring>
 #include <functional>
-#include <iterator>
 #include <memory>
 #include <string>
 #include <type_traits>
@@ -31,16 +30,6 @@ protected:
         fake_vendor_reset();
     }
 
-    voktest::Module connect(const char* name) {
-        return voktest::registerModule(name, fake_vendor_function_list());
-    }
-
-    void disconnect(const voktest::Module& module) {
-        ModuleEntry* entry = removeModuleEntry(env_, module.object);
-        ASSERT_EQ(entry, module.entry);
-        free(entry);
-    }
-
     std::unique_ptr<IVokPkcs11> instance(const char* name) {
         return std::unique_ptr<IVokPkcs11>(IVokPkcs11::getInstance(name));
     }
@@ -48,88 +37,30 @@ protected:
     voktest::LogCapture log_;
 };
 
-TEST_F(NativeInterfaceTest, UnregisteredModuleAnswersFunctionFailedUntilRegistered) {
-    auto token = instance("token-a");
-    ASSERT_NE(token, nullptr);
+// An instance keeps its own copy of the name and looks the module up at each
+// call; a null name reaches the first module.
+TEST_F(NativeInterfaceTest, AnInstanceFindsItsModuleByNameAtEachCall) {
+    char name[] = "token-a";
+    auto token = instance(name);
+    auto other = instance(name);
+    ASSERT_NE(token.get(), other.get());
+    std::strcpy(name, "other-x");
+    other.reset();
 
     EXPECT_EQ(token->C_Initialize(nullptr), CKR_FUNCTION_FAILED);
-    EXPECT_TRUE(log_.contains(kTag, "C_Initialize..."));
-    EXPECT_TRUE(log_.contains(kTag, "getFunctions return NULL"));
-    EXPECT_EQ(fake_vendor_call_count(), 0u);
-
-    voktest::Module module = connect("token-a");
+    EXPECT_EQ(log_.texts(kTag), (std::vector<std::string>{"C_Initialize...", "getFunctions return NULL"}));
+    voktest::Module module = voktest::registerModule("token-a", fake_vendor_function_list());
     EXPECT_EQ(token->C_Initialize(nullptr), CKR_OK);
     EXPECT_EQ(fake_vendor_call_count(), 1u);
-
-    disconnect(module);
+    std::free(removeModuleEntry(env_, module.object));
     EXPECT_EQ(token->C_Finalize(nullptr), CKR_FUNCTION_FAILED);
     EXPECT_EQ(fake_vendor_call_count(), 1u);
-}
 
-TEST_F(NativeInterfaceTest, InstancesAreDistinctAndOwnTheirName) {
-    connect("token-b");
-    char name[] = "token-b";
-    auto first = instance(name);
-    auto second = instance(name);
-    ASSERT_NE(first.get(), second.get());
-
-    // The caller's buffer is its own: changing it does not rebind an instance.
-    std::strcpy(name, "other-x");
-    first.reset();
-    EXPECT_EQ(second->C_Initialize(nullptr), CKR_OK);
-    EXPECT_EQ(fakevendor::lastCall("C_Initialize").rv, CKR_OK);
-}
-
-TEST_F(NativeInterfaceTest, NullNameReachesTheFirstModule) {
-    connect("first");
-    connect("second");
-    auto any = instance(nullptr);
-    EXPECT_EQ(any->C_Initialize(nullptr), CKR_OK);
-    EXPECT_EQ(fake_vendor_call_count(), 1u);
-}
-
-TEST_F(NativeInterfaceTest, GetFunctionListIsNotOffered) {
-    connect("token-c");
-    auto token = instance("token-c");
-    CK_FUNCTION_LIST_PTR list = nullptr;
-    log_.clear();
-    EXPECT_EQ(token->C_GetFunctionList(&list), CKR_FUNCTION_NOT_SUPPORTED);
-    EXPECT_EQ(list, nullptr);
-    EXPECT_TRUE(log_.texts(kTag).empty());
-    EXPECT_EQ(fake_vendor_call_count(), 0u);
-}
-
-// The first group logs the result with %d, the rest with %llu, and C_Verify
-// and C_CancelFunction not at all.
-TEST_F(NativeInterfaceTest, ResultLogFormatsFollowTheMethodGroup) {
-    connect("token-d");
-    auto token = instance("token-d");
-    const CK_RV big = 0x1234567890ULL;
-    struct Case {
-        const char* function;
-        std::function<CK_RV()> call;
-        const char* resultLine;  // nullptr: no result line
-    };
-    CK_BYTE data[4] = {1, 2, 3, 4};
-    const Case cases[] = {
-        {"C_GetOperationState", [&] { return token->C_GetOperationState(7, nullptr, nullptr); },
-         "return 878082192"},
-        {"C_SetOperationState", [&] { return token->C_SetOperationState(7, data, 4, 0, 0); },
-         "return 78187493520"},
-        {"C_Verify", [&] { return token->C_Verify(7, data, 4, data, 4); }, nullptr},
-        {"C_CancelFunction", [&] { return token->C_CancelFunction(7); }, nullptr},
-        {"C_WaitForSlotEvent", [&] { return token->C_WaitForSlotEvent(0, nullptr, nullptr); },
-         "return 78187493520"},
-    };
-    for (const Case& c : cases) {
-        SCOPED_TRACE(c.function);
-        ASSERT_EQ(fake_vendor_set_next_rv(c.function, big), CKR_OK);
-        log_.clear();
-        EXPECT_EQ(c.call(), big);
-        std::vector<std::string> expected = {std::string(c.function) + "..."};
-        if (c.resultLine) expected.push_back(c.resultLine);
-        EXPECT_EQ(log_.texts(kTag), expected);
-    }
+    static CK_FUNCTION_LIST empty{};  // registered: outlives the test
+    voktest::registerModule("first", fake_vendor_function_list());
+    voktest::registerModule("second", &empty);
+    EXPECT_EQ(instance(nullptr)->C_Finalize(nullptr), CKR_OK);
+    EXPECT_EQ(fake_vendor_call_count(), 2u);
 }
 
 // Every forwarder hands its own module function each argument unchanged and
@@ -179,9 +110,13 @@ std::vector<uint64_t> callWithDistinct(IVokPkcs11* token, CK_RV (IVokPkcs11::*me
     return callWithDistinct(token, method, index, rv, std::index_sequence_for<Args...>());
 }
 
-TEST_F(NativeInterfaceTest, EveryForwarderHandsItsOwnFunctionTheArgumentsUnchanged) {
+// Each forwarder logs its name, and its result with %d (the first group, up
+// to C_GetOperationState), not at all (C_Verify, C_CancelFunction) or with
+// %llu (the rest). A list that leaves the entry NULL does not offer the
+// function; C_GetFunctionList is never offered.
+TEST_F(NativeInterfaceTest, EveryForwarderReachesItsOwnFunctionAndLogsByItsGroup) {
     struct Row {
-        const char* name;
+        std::string name;
         size_t index;
         std::function<std::vector<uint64_t>(IVokPkcs11*, CK_RV*)> call;
     };
@@ -196,47 +131,40 @@ TEST_F(NativeInterfaceTest, EveryForwarderHandsItsOwnFunctionTheArgumentsUnchang
                     }});
     VOK_CK_FUNCTIONS(VOK_ROW)
 #undef VOK_ROW
+    const size_t lastNarrow = VOK_INDEX(C_GetOperationState);
 #undef VOK_INDEX
+    ASSERT_EQ(rows.size(), 68u);
     voktest::registerModule("recorders", &list);
     auto token = instance("recorders");
+    static std::vector<CK_FUNCTION_LIST> gaps(rows.size(), list);
+    const Recorded none{~size_t(0), {}};
     for (const Row& row : rows) {
-        if (std::string(row.name) == "C_GetFunctionList") continue;  // not offered
         SCOPED_TRACE(row.name);
-        gRecorded = {};
+        const bool offered = row.name != "C_GetFunctionList";
+        gRecorded = none;
+        log_.clear();
         CK_RV rv = 0;
         const std::vector<uint64_t> sent = row.call(token.get(), &rv);
-        EXPECT_EQ(gRecorded.index, row.index);
-        EXPECT_EQ(gRecorded.args, sent);
-        EXPECT_EQ(rv, 0x80000000UL + row.index);
-    }
-}
+        EXPECT_EQ(gRecorded.index, offered ? row.index : none.index);
+        EXPECT_EQ(gRecorded.args, offered ? sent : none.args);
+        EXPECT_EQ(rv, offered ? 0x80000000UL + row.index : CKR_FUNCTION_NOT_SUPPORTED);
+        std::vector<std::string> lines;
+        if (offered) lines.push_back(row.name + "...");
+        if (offered && row.name != "C_Verify" && row.name != "C_CancelFunction")
+            lines.push_back("return " + (row.index <= lastNarrow
+                                             ? std::to_string(static_cast<int32_t>(rv))
+                                             : std::to_string(rv)));
+        EXPECT_EQ(log_.texts(kTag), lines);
+        if (!offered) continue;
 
-// Every argument zero or NULL: the calls below never reach a module.
-template <class... Args>
-CK_RV callWithZeros(IVokPkcs11* token, CK_RV (IVokPkcs11::*method)(Args...)) {
-    return (token->*method)(Args{}...);
-}
-
-struct Forwarder {
-    const char* name;
-    size_t entry;  // offset of the function's entry in the list
-    CK_RV (*call)(IVokPkcs11*);
-};
-#define VOK_FORWARDER(name, params)           \
-    {#name, offsetof(CK_FUNCTION_LIST, name), \
-     [](IVokPkcs11* t) { return callWithZeros(t, &IVokPkcs11::name); }},
-const Forwarder kForwarders[] = {VOK_CK_FUNCTIONS(VOK_FORWARDER)};
-
-TEST_F(NativeInterfaceTest, AFunctionTheListLeavesNullIsNotSupported) {
-    std::vector<CK_FUNCTION_LIST> lists(std::size(kForwarders), *fake_vendor_function_list());
-    for (size_t i = 0; i < lists.size(); ++i) {
-        const Forwarder& f = kForwarders[i];
-        SCOPED_TRACE(f.name);
-        std::memset(reinterpret_cast<char*>(&lists[i]) + f.entry, 0, sizeof(void*));
-        const std::string name = std::string("gap-") + f.name;
-        voktest::registerModule(name.c_str(), &lists[i]);
-        EXPECT_EQ(f.call(instance(name.c_str()).get()), CKR_FUNCTION_NOT_SUPPORTED);
-        EXPECT_EQ(fake_vendor_call_count(), 0u);
+        CK_FUNCTION_LIST& gap = gaps[row.index];
+        std::memset(reinterpret_cast<char*>(&gap.C_Initialize) + row.index * sizeof(void*), 0,
+                    sizeof(void*));
+        voktest::registerModule(("gap-" + row.name).c_str(), &gap);
+        gRecorded = none;
+        row.call(instance(("gap-" + row.name).c_str()).get(), &rv);
+        EXPECT_EQ(rv, CKR_FUNCTION_NOT_SUPPORTED);
+        EXPECT_EQ(gRecorded.index, none.index);
     }
 }
 
