@@ -23,81 +23,6 @@ protected:
     }
 };
 
-Field version(int major, int minor) { return Field::message({major, minor}); }
-std::string bytesOf(const void* p, size_t n) { return std::string(static_cast<const char*>(p), n); }
-
-// Full-width texts are copied with their terminator, which the later fields
-// absorb: flags rewrites the manufacturer's, the description's clears
-// libraryVersion.major. A text longer than its field leaves the field alone.
-TEST_F(SlotObjectProxies, GetInfoCopiesVersionsThenTextsAroundTheFlags) {
-    CK_INFO out;
-    memset(&out, 0xa5, sizeof(out));
-    script("C_GetInfo", CKR_OK, 3,
-           {Field::message({version(2, 40), std::string(32, 'M'), kFlags, "Library",
-                            version(0x107, 9)})});  // major cut to one byte
-    ASSERT_EQ(CKR_OK, C_GetInfo(&out));
-    EXPECT_EQ("\x02\x28", bytesOf(&out.cryptokiVersion, 2));
-    EXPECT_EQ(std::string(32, 'M'), bytesOf(out.manufacturerID, 32));
-    EXPECT_EQ(kFlags, CK_FLAGS{out.flags});  // packed: compare a copy
-    EXPECT_EQ(bytesOf("Library\0\xa5", 9), bytesOf(out.libraryDescription, 9));
-    EXPECT_EQ("\x07\x09", bytesOf(&out.libraryVersion, 2));
-
-    memset(&out, 0xa5, sizeof(out));
-    script("C_GetInfo", CKR_OK, 3,
-           {Field::message({version(2, 40), std::string(33, 'M'), kFlags, std::string(32, 'D'),
-                            version(7, 9)})});
-    ASSERT_EQ(CKR_OK, C_GetInfo(&out));
-    EXPECT_EQ(std::string(32, '\xa5'), bytesOf(out.manufacturerID, 32));
-    EXPECT_EQ(kFlags, CK_FLAGS{out.flags});  // packed: compare a copy
-    EXPECT_EQ(std::string(32, 'D'), bytesOf(out.libraryDescription, 32));
-    EXPECT_EQ(bytesOf("\0\x09", 2), bytesOf(&out.libraryVersion, 2));
-}
-
-TEST_F(SlotObjectProxies, GetSlotInfoFullWidthDescriptionClearsTheManufacturersFirstByte) {
-    CK_SLOT_INFO out;
-    memset(&out, 0xa5, sizeof(out));
-    script("C_GetSlotInfo", CKR_OK, 5,
-           {Field::message({std::string(64, 'S'), "Maker", kFlags, version(1, 2), version(3, 4)})});
-    ASSERT_EQ(CKR_OK, C_GetSlotInfo(kSlot, &out));
-    EXPECT_EQ(std::string(64, 'S'), bytesOf(out.slotDescription, 64));
-    EXPECT_EQ(bytesOf("\0aker\0\xa5", 7), bytesOf(out.manufacturerID, 7));
-    EXPECT_EQ(kFlags, CK_FLAGS{out.flags});  // packed: compare a copy
-    EXPECT_EQ("\x01\x02\x03\x04", bytesOf(&out.hardwareVersion, 4));
-}
-
-TEST_F(SlotObjectProxies, GetTokenInfoCopiesTextsToTheirWidthAndEveryCounter) {
-    CK_TOKEN_INFO out;
-    memset(&out, 0xa5, sizeof(out));
-    script("C_GetTokenInfo", CKR_OK, 16,
-           {Field::message({std::string(40, 'L'), std::string(32, 'M'), "abc", std::string(16, '7'),
-                            kFlags, 1, 2, 3, 4, 5, 6, 7, 8, 9, kKey, version(1, 2), version(3, 4),
-                            "2024"})});
-    ASSERT_EQ(CKR_OK, C_GetTokenInfo(kSlot, &out));
-    EXPECT_EQ(std::string(32, 'L'), bytesOf(out.label, 32));
-    EXPECT_EQ(std::string(32, 'M'), bytesOf(out.manufacturerID, 32));
-    EXPECT_EQ(bytesOf("abc", 3) + std::string(13, '\0'), bytesOf(out.model, 16));
-    EXPECT_EQ(std::string(16, '7'), bytesOf(out.serialNumber, 16));
-    const CK_ULONG numbers[] = {kFlags, 1, 2, 3, 4, 5, 6, 7, 8, 9, kKey};
-    EXPECT_EQ(bytesOf(numbers, sizeof(numbers)), bytesOf(&out.flags, sizeof(numbers)));
-    EXPECT_EQ("\x01\x02\x03\x04", bytesOf(&out.hardwareVersion, 4));
-    EXPECT_EQ(bytesOf("2024", 4) + std::string(12, '\0'), bytesOf(out.utcTime, 16));
-}
-
-TEST_F(SlotObjectProxies, SessionAndMechanismInfoCopyEveryField) {
-    CK_SESSION_INFO session{};
-    script("C_GetSessionInfo", CKR_OK, 15, {Field::message({kSlot, 3, kFlags, kKey})});
-    ASSERT_EQ(CKR_OK, C_GetSessionInfo(kSession, &session));
-    const CK_ULONG sessionFields[] = {kSlot, 3, kFlags, kKey};
-    EXPECT_EQ(bytesOf(sessionFields, sizeof(sessionFields)), bytesOf(&session, sizeof(session)));
-
-    CK_MECHANISM_INFO mechanism{};
-    script("C_GetMechanismInfo", CKR_OK, 17, {Field::message({128, kKey, kFlags})});
-    ASSERT_EQ(CKR_OK, C_GetMechanismInfo(kSlot, CKM_AES_CBC, &mechanism));
-    const CK_ULONG mechanismFields[] = {128, kKey, kFlags};
-    EXPECT_EQ(bytesOf(mechanismFields, sizeof(mechanismFields)),
-              bytesOf(&mechanism, sizeof(mechanism)));
-}
-
 // C_GetSlotList and C_GetMechanismList share the list rule; both answers carry
 // the list in field 1 and the count in field 2.
 TEST_F(SlotObjectProxies, ListsFollowTheTwoCallConventionWithinTheCallersList) {
@@ -227,24 +152,6 @@ TEST_F(SlotObjectProxies, RawBytesNeverLandInACallersNestedTemplate) {
     }
 }
 
-TEST_F(SlotObjectProxies, FindObjectsInitRewritesTheTemplateWhetherOrNotAValueCame) {
-    char value[4 + 4];
-    memcpy(value, "....####", 8);
-    alignas(8) CK_ATTRIBUTE tmpl[3] = {
-        {CKA_LABEL, value, 4}, {CKA_CLASS, nullptr, 8}, {CKA_ID, nullptr, 9}};
-    script("C_FindObjectsInit", CKR_OK, 8,
-           {Field::attributes(
-               {{CKA_VALUE, "0123456789", 10}, {CKA_TOKEN, Field(), 1}, {CKA_KEY_TYPE, "k", 1}})});
-    ASSERT_EQ(CKR_OK, C_FindObjectsInit(kSession, tmpl, 2));
-    EXPECT_EQ(CKA_VALUE, tmpl[0].type);
-    EXPECT_EQ("0123####", std::string(value, 8));
-    EXPECT_EQ(4u, tmpl[0].ulValueLen);  // what was written, never more
-    EXPECT_EQ(CKA_TOKEN, tmpl[1].type);
-    EXPECT_EQ(nullptr, tmpl[1].pValue);
-    EXPECT_EQ(1u, tmpl[1].ulValueLen);
-    EXPECT_EQ(CKA_ID, tmpl[2].type);
-}
-
 TEST_F(SlotObjectProxies, FindObjectsCopiesNoMoreHandlesThanTheCallerAllows) {
     List handles(4, kPattern);
     CK_ULONG found = 0;
@@ -257,52 +164,6 @@ TEST_F(SlotObjectProxies, FindObjectsCopiesNoMoreHandlesThanTheCallerAllows) {
     ASSERT_EQ(CKR_OK, C_FindObjects(kSession, handles.data(), 3, &found));
     EXPECT_EQ((List{9, 2, 3, kPattern}), handles);
     EXPECT_EQ(1u, found);
-}
-
-TEST_F(SlotObjectProxies, HandlesComeBackFromTheirOwnFields) {
-    static CK_ULONG handle, other;
-    struct Case {
-        const char* name;  // the answer's
-        CK_RV (*call)();
-        int field;
-        std::vector<Field> fields;
-        CK_ULONG handle, other;  // afterwards; `other` starts as 0
-    };
-    // clang-format off
-    const Case cases[] = {
-        {"C_CreateObject", [] { return C_CreateObject(kSession, nullptr, 0, &handle); }, 23,
-         {Field::repeated({kObject, kKey})}, kObject, 0},
-        {"C_CopyObject", [] { return C_CopyObject(kSession, kObject, nullptr, 0, &handle); }, 24,
-         {}, kObject, 0},  // present, without a handle: the previous value stays
-        {"C_CopyObject", [] { return C_CopyObject(kSession, kObject, nullptr, 0, &handle); }, 24,
-         {Field::repeated({kOtherKey})}, kOtherKey, 0},
-        {"C_OpenSession", [] { return C_OpenSession(kSlot, kFlags, nullptr, nullptr, &handle); }, 6,
-         {kSession}, kSession, 0},
-        {"C_GetObjectSize", [] { return C_GetObjectSize(kSession, kObject, &handle); }, 25, {kKey},
-         kKey, 0},
-        {"C_GenerateKey", [] { return C_GenerateKey(kSession, nullptr, nullptr, 0, &handle); }, 39,
-         {kObject}, kObject, 0},
-        {"C_GenerateKeyPair", [] {
-             return C_GenerateKeyPair(kSession, nullptr, nullptr, 0, nullptr, 0, &handle, &other);
-         }, 40, {kKey, kOtherKey}, kKey, kOtherKey},
-        {"C_UnWrapKey", [] {
-             return C_UnwrapKey(kSession, nullptr, kKey, nullptr, 0, nullptr, 0, &handle);
-         }, 42, {kObject}, kObject, 0},
-        // Deployed services answer C_DeriveKey under another name; the answer still counts.
-        {"C_UnDeriveKey", [] { return C_DeriveKey(kSession, nullptr, kKey, nullptr, 0, &handle); },
-         43, {kOtherKey}, kOtherKey, 0},
-        {"C_WaitForSlotEvent", [] { return C_WaitForSlotEvent(kFlags, &handle, nullptr); }, 44,
-         {kSlot}, kSlot, 0},
-    };
-    // clang-format on
-    for (const Case& c : cases) {
-        SCOPED_TRACE(c.name);
-        other = 0;
-        script(c.name, CKR_KEY_SIZE_RANGE, c.field, c.fields);
-        ASSERT_EQ(CKR_KEY_SIZE_RANGE, c.call());
-        EXPECT_EQ(c.handle, handle);
-        EXPECT_EQ(c.other, other);
-    }
 }
 
 // Texts are read only within the caller's stated length (exact-size heap
