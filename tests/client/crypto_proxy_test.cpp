@@ -13,73 +13,37 @@ namespace voktest {
 namespace {
 
 CK_BYTE gIn[4] = {'i', 'n', 0, 'x'};
-CK_MECHANISM gMechanism{CKM_AES_CBC, nullptr, 0};
-
-struct SentOutput {
-    bool present;  // the bytes field of the output pair
-    std::string bytes;
-    CK_ULONG capacity;
-};
-
-// Every proxy whose output follows the output-buffer rule: how to call it with
-// (out, outLen), where its answer goes (data in field 1, length in field 2),
-// and what its request said about the buffer.
-struct OutputProxy {
-    const char* name;
-    CK_RV (*call)(CK_BYTE* out, CK_ULONG* outLen);
-    int answerField;
-    SentOutput (*sent)(const pkcs11::Operation&);
-};
-
-// clang-format off
-#define OUTPUT_PROXY(function, answerField, request, data, length, ...)                    \
-    OutputProxy{#function,                                                                  \
-                [](CK_BYTE* out, CK_ULONG* outLen) { return function(__VA_ARGS__); },       \
-                answerField,                                                                \
-                [](const pkcs11::Operation& op) {                                           \
-                    return SentOutput{op.request().has_##data(), op.request().data(),       \
-                                      op.request().length()};                               \
-                }}
-// The two argument shapes: output only, and input then output.
-#define OUT(function, field, request, data, length) \
-    OUTPUT_PROXY(function, field, request, data, length, kSession, out, outLen)
-#define IN_OUT(function, field, request, data, length) \
-    OUTPUT_PROXY(function, field, request, data, length, kSession, gIn, 4, out, outLen)
-
-const OutputProxy kOutputProxies[] = {
-    OUT(C_GetOperationState, 22, getoperationstate, poperationstate, puloperationstatelen),
-    IN_OUT(C_Encrypt, 11, enc, pencrypteddata, pulencrypteddatalen),
-    IN_OUT(C_EncryptUpdate, 27, encryptupdate, pencryptedpart, pulencryptedpartlen),
-    OUT(C_EncryptFinal, 28, encryptfinal, plastencryptedpart, pullastencryptedpartlen),
-    IN_OUT(C_Decrypt, 12, dec, pdata, puldatalen),
-    IN_OUT(C_DecryptUpdate, 29, decryptupdate, ppart, pulpartlen),
-    OUT(C_DecryptFinal, 30, decryptfinal, plastpart, pullastpartlen),
-    IN_OUT(C_Digest, 18, digest, pdigest, puldigestlen),
-    OUT(C_DigestFinal, 31, digestfinal, pdigest, puldigestlen),
-    IN_OUT(C_Sign, 13, sign, psignature, pulsignaturelen),
-    OUT(C_SignFinal, 32, signfinal, psignature, pulsignaturelen),
-    IN_OUT(C_SignRecover, 33, signrecover, psignature, pulsignaturelen),
-    IN_OUT(C_VerifyRecover, 34, verifyrecover, pdata, puldatalen),
-    IN_OUT(C_DigestEncryptUpdate, 35, digestencryptupdate, pencryptedpart, pulencryptedpartlen),
-    IN_OUT(C_DecryptDigestUpdate, 36, decryptdigestupdate, ppart, pulpartlen),
-    IN_OUT(C_SignEncryptUpdate, 37, signencryptupdate, pencryptedpart, pulencryptedpartlen),
-    IN_OUT(C_DecryptVerifyUpdate, 38, decryptverifyupdate, ppart, pulpartlen),
-    OUTPUT_PROXY(C_WrapKey, 41, wrapkey, pwrappedkey, pulwrappedkeylen, kSession, &gMechanism, kKey,
-                 kOtherKey, out, outLen),
-};
-// clang-format on
-
 const std::string kProduced("\x01\x00\x02\x03\x04\x05\x06\x07\x08\x09", 10);
 constexpr size_t kGuard = 8;
 
+// Every proxy whose output follows the output-buffer rule, called with the
+// test's buffer and length pointer.
 class OutputBuffers : public ::testing::Test {
 protected:
     TestService& service = TestService::start();
+    std::vector<const ProxyCall*> proxies;
 
-    void script(const OutputProxy& proxy, CK_RV rv, const std::string& data, CK_ULONG length) {
-        service.scriptRaw(encodeAnswer(proxy.name, rv, proxy.answerField, {data, length}));
+    void SetUp() override {
+        for (const ProxyCall& p : everyProxyCall())
+            if (p.outputAnswer) proxies.push_back(&p);
+        ASSERT_EQ(18u, proxies.size());
     }
-    SentOutput sent(const OutputProxy& proxy) const { return proxy.sent(service.lastRequest()); }
+    CK_RV call(const ProxyCall& p, CK_BYTE* out, CK_ULONG* outLen) {
+        gCaller.reset();
+        gCaller.out = out;
+        gCaller.outLen = outLen;
+        return p.call(functionList());
+    }
+    void script(const ProxyCall& p, CK_RV rv, const std::string& data, CK_ULONG length) {
+        service.scriptRaw(encodeAnswer(p.name, rv, p.outputAnswer, {data, length}));
+    }
+    // The request's exact bytes, ending with what it said about the buffer.
+    void expectSent(const ProxyCall& p, const Field& contents, CK_ULONG capacity) {
+        std::vector<Field> fields = p.request;
+        fields[fields.size() - 2] = contents;
+        fields.back() = capacity;
+        EXPECT_EQ(hex(encodeRequest(p.name, p.field, fields)), hex(service.lastRequestBytes()));
+    }
 };
 
 // The caller's buffer holds `capacity` bytes, then guard bytes. Its first byte
@@ -103,18 +67,16 @@ TEST_F(OutputBuffers, ResultComesBackWithinTheBufferWithItsLength) {
         {4, CKR_OK, kProduced, 10, CKR_BUFFER_TOO_SMALL, "", 4, 10},
         {16, CKR_OK, "abc", 12, CKR_OK, "abc", 3, 3},
     };
-    for (const OutputProxy& proxy : kOutputProxies) {
+    for (const ProxyCall* proxy : proxies) {
         for (const auto& a : answers) {
-            SCOPED_TRACE(std::string(proxy.name) + " " + std::to_string(a.capacity) + " " +
+            SCOPED_TRACE(std::string(proxy->name) + " " + std::to_string(a.capacity) + " " +
                          std::to_string(a.rv) + " " + std::to_string(a.stated));
             std::vector<CK_BYTE> out(a.capacity + kGuard, 0xa5);
             out[0] = 0;
             CK_ULONG length = a.capacity;
-            script(proxy, a.rv, a.data, a.stated);
-            EXPECT_EQ(a.returned, proxy.call(out.data(), &length));
-            EXPECT_TRUE(sent(proxy).present);
-            EXPECT_EQ("", sent(proxy).bytes);
-            EXPECT_EQ(a.capacity, sent(proxy).capacity);
+            script(*proxy, a.rv, a.data, a.stated);
+            EXPECT_EQ(a.returned, call(*proxy, out.data(), &length));
+            expectSent(*proxy, "", a.capacity);
             EXPECT_EQ(a.written, std::string(out.begin(), out.begin() + a.written.size()));
             EXPECT_EQ(std::string(out.size() - a.keptFrom, '\xa5'),
                       std::string(out.begin() + a.keptFrom, out.end()));
@@ -129,41 +91,40 @@ TEST_F(OutputBuffers, NullBufferIsALengthQuery) {
         {CKR_BUFFER_TOO_SMALL, CKR_OK},
         {CKR_OK, CKR_OK},
         {CKR_OPERATION_NOT_INITIALIZED, CKR_OPERATION_NOT_INITIALIZED}};
-    for (const OutputProxy& proxy : kOutputProxies) {
+    for (const ProxyCall* proxy : proxies) {
         for (const auto& rv : moduleToCaller) {
-            SCOPED_TRACE(std::string(proxy.name) + " " + std::to_string(rv.first));
+            SCOPED_TRACE(std::string(proxy->name) + " " + std::to_string(rv.first));
             CK_ULONG length = 77;
-            script(proxy, rv.first, "", 10);
-            EXPECT_EQ(rv.second, proxy.call(nullptr, &length));
-            EXPECT_FALSE(sent(proxy).present);
-            EXPECT_EQ(0u, sent(proxy).capacity);
+            script(*proxy, rv.first, "", 10);
+            EXPECT_EQ(rv.second, call(*proxy, nullptr, &length));
+            expectSent(*proxy, Field(), 0);
             EXPECT_EQ(10u, length);
         }
     }
 }
 
 TEST_F(OutputBuffers, NullLengthPointerIsNeitherReadNorWritten) {
-    for (const OutputProxy& proxy : kOutputProxies) {
-        SCOPED_TRACE(proxy.name);
+    for (const ProxyCall* proxy : proxies) {
+        SCOPED_TRACE(proxy->name);
         std::vector<CK_BYTE> out(16, 'x');
-        script(proxy, CKR_OK, kProduced, kProduced.size());
-        EXPECT_EQ(CKR_BUFFER_TOO_SMALL, proxy.call(out.data(), nullptr));  // capacity 0
-        EXPECT_EQ(0u, sent(proxy).capacity);
+        script(*proxy, CKR_OK, kProduced, kProduced.size());
+        EXPECT_EQ(CKR_BUFFER_TOO_SMALL, call(*proxy, out.data(), nullptr));  // capacity 0
+        expectSent(*proxy, "", 0);
         EXPECT_EQ(std::vector<CK_BYTE>(16, 'x'), out);
-        script(proxy, CKR_OK, kProduced, kProduced.size());
-        EXPECT_EQ(CKR_OK, proxy.call(nullptr, nullptr));
+        script(*proxy, CKR_OK, kProduced, kProduced.size());
+        EXPECT_EQ(CKR_OK, call(*proxy, nullptr, nullptr));
     }
 }
 
 // Without a zero byte the buffer is read only within the caller's length (an
 // exact-size heap buffer lets the sanitizer see an over-read).
 TEST_F(OutputBuffers, UnterminatedBufferIsReadWithinItsLength) {
-    for (const OutputProxy& proxy : kOutputProxies) {
-        SCOPED_TRACE(proxy.name);
+    for (const ProxyCall* proxy : proxies) {
+        SCOPED_TRACE(proxy->name);
         std::unique_ptr<CK_BYTE[]> out(new CK_BYTE[4]{'w', 'x', 'y', 'z'});
         CK_ULONG length = 4;
-        EXPECT_EQ(CKR_OK, proxy.call(out.get(), &length));
-        EXPECT_EQ("wxyz", sent(proxy).bytes);
+        EXPECT_EQ(CKR_OK, call(*proxy, out.get(), &length));
+        expectSent(*proxy, "wxyz", 4);
     }
 }
 
@@ -172,14 +133,13 @@ TEST_F(OutputBuffers, UnterminatedBufferIsReadWithinItsLength) {
 constexpr CK_ULONG kAbove4GiB = (CK_ULONG{1} << 32) + 1;
 
 TEST_F(OutputBuffers, CapacityAboveFourGiBIsReadUpToTheZeroByte) {
-    for (const OutputProxy& proxy : kOutputProxies) {
-        SCOPED_TRACE(proxy.name);
+    for (const ProxyCall* proxy : proxies) {
+        SCOPED_TRACE(proxy->name);
         std::vector<CK_BYTE> out(16, 0xa5);
         memcpy(out.data(), "abc", 4);
         CK_ULONG length = kAbove4GiB;
-        proxy.call(out.data(), &length);
-        EXPECT_EQ("abc", sent(proxy).bytes);
-        EXPECT_EQ(kAbove4GiB, sent(proxy).capacity);
+        call(*proxy, out.data(), &length);
+        expectSent(*proxy, "abc", kAbove4GiB);
     }
 }
 
