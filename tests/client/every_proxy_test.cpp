@@ -127,16 +127,18 @@ TEST_F(EveryProxy, CopiesItsAnswerIntoItsOwnOutputsOnly) {
         {"C_GetSlotInfo", 5, {Field::message({std::string(64, 'S'), "Maker", kFlags, version(1, 2),
                                               version(3, 4)})},
          [](CallerMemory& m) {
-             memset(m.slotInfo.slotDescription, 'S', 64), memcpy(m.slotInfo.manufacturerID, "\0aker", 6);
-             m.slotInfo.flags = kFlags, m.slotInfo.hardwareVersion = {1, 2}, m.slotInfo.firmwareVersion = {3, 4};
+             CK_SLOT_INFO& s = m.slotInfo;
+             memset(s.slotDescription, 'S', 64), memcpy(s.manufacturerID, "\0aker", 6);
+             s.flags = kFlags, s.hardwareVersion = {1, 2}, s.firmwareVersion = {3, 4};
          }},
         // Token texts are cut or padded with zeros to their width.
         {"C_GetTokenInfo", 16, {Field::message({std::string(40, 'L'), std::string(32, 'M'), "abc",
-                                                std::string(16, '7'), kFlags, 1, 2, 3, 4, 5, 6, 7, 8,
-                                                9, kKey, version(1, 2), version(3, 4), "2024"})},
+                                                std::string(16, '7'), kFlags, 1, 2, 3, 4, 5, 6, 7,
+                                                8, 9, kKey, version(1, 2), version(3, 4), "2024"})},
          [](CallerMemory& m) {
              CK_TOKEN_INFO& t = m.tokenInfo;
-             memset(t.label, 'L', 32), memset(t.manufacturerID, 'M', 32), memset(t.serialNumber, '7', 16);
+             memset(t.label, 'L', 32), memset(t.manufacturerID, 'M', 32);
+             memset(t.serialNumber, '7', 16);
              memset(t.model, 0, 16), memcpy(t.model, "abc", 3);
              memset(t.utcTime, 0, 16), memcpy(t.utcTime, "2024", 4);
              const CK_ULONG numbers[] = {kFlags, 1, 2, 3, 4, 5, 6, 7, 8, 9, kKey};
@@ -160,7 +162,8 @@ TEST_F(EveryProxy, CopiesItsAnswerIntoItsOwnOutputsOnly) {
         {"C_GetObjectSize", 25, {kKey}, [](CallerMemory& m) { m.count = kKey; }},
         // Rewritten whether or not a value came, within the caller's buffers and count.
         {"C_FindObjectsInit", 8, {Field::attributes({{CKA_VALUE, "0123456789", 10},
-                                                     {CKA_ID, Field(), 1}, {CKA_KEY_TYPE, "k", 1}})},
+                                                     {CKA_ID, Field(), 1},
+                                                     {CKA_KEY_TYPE, "k", 1}})},
          [](CallerMemory& m) {
              memcpy(m.value, "01234", 5), m.tmpl[0].type = CKA_VALUE;
              m.tmpl[1].type = CKA_ID, m.tmpl[1].ulValueLen = 1;
@@ -180,7 +183,8 @@ TEST_F(EveryProxy, CopiesItsAnswerIntoItsOwnOutputsOnly) {
             if (std::string(p.name) == row.name) proxy = &p;
         ASSERT_NE(nullptr, proxy);
         // Deployed services answer C_DeriveKey under another name; no answer's name is checked.
-        service.scriptRaw(encodeAnswer("C_UnDeriveKey", CKR_KEY_SIZE_RANGE, row.field, row.answer));
+        service.scriptRaw(
+            encodeAnswer("C_UnDeriveKey", CKR_KEY_SIZE_RANGE, row.field, row.answer));
         EXPECT_EQ(CKR_KEY_SIZE_RANGE, run(*proxy));
         CallerMemory expected;
         memcpy(&expected, &before, sizeof expected);
