@@ -110,6 +110,8 @@ void CallerMemory::reset() {
     tmpl[0] = CK_ATTRIBUTE{CKA_LABEL, value, sizeof(value)};
     tmpl[1] = CK_ATTRIBUTE{CKA_TOKEN, nullptr, 7};
     mechanism = CK_MECHANISM{CKM_AES_CBC, parameter, sizeof(parameter)};
+    out = output;
+    outLen = &outputLen;
 }
 
 CK_FUNCTION_LIST_PTR functionList() {
@@ -142,14 +144,17 @@ pkcs11::OperationResult answer(const std::string& name, CK_RV result) {
 // The common argument shapes, as sent and as passed: input then output,
 // output only, a mechanism and a key.
 #define IN_OUT_SENT (kSession, kInput, 8, kOutput, 16)
-#define IN_OUT kSession, c.input, 8, c.output, &c.outputLen
+#define IN_OUT kSession, c.input, 8, c.out, c.outLen
 #define OUT_SENT (kSession, kOutput, 16)
-#define OUT kSession, c.output, &c.outputLen
+#define OUT kSession, c.out, c.outLen
 #define MECHANISM_KEY_SENT (kSession, kMechanism, kKey)
 #define MECHANISM_KEY kSession, &c.mechanism, kKey
 #define PROXY(function, field, fields, ...)                                   \
     ProxyCall{#function, [](F f) { return f->function(__VA_ARGS__); }, field, \
               {UNPARENTHESIZE fields}}
+#define OUTPUT(function, field, answer, fields, ...)                          \
+    ProxyCall{#function, [](F f) { return f->function(__VA_ARGS__); }, field, \
+              {UNPARENTHESIZE fields}, answer}
 
 const std::vector<ProxyCall>& everyProxyCall() {
     static const std::vector<ProxyCall> calls = {
@@ -172,7 +177,7 @@ const std::vector<ProxyCall>& everyProxyCall() {
         PROXY(C_CloseSession, 6, (kSession), kSession),
         PROXY(C_CloseAllSessions, 33, (kSlot), kSlot),
         PROXY(C_GetSessionInfo, 24, (kSession), kSession, &c.sessionInfo),
-        PROXY(C_GetOperationState, 34, OUT_SENT, OUT),
+        OUTPUT(C_GetOperationState, 34, 22, OUT_SENT, OUT),
         PROXY(C_SetOperationState, 35, (kSession, kInput, 8, kKey, kOtherKey),
               kSession, c.input, 8, kKey, kOtherKey),
         PROXY(C_Login, 7, (kSession, CKU_USER, kPin, 8), kSession, CKU_USER, c.pin, 8),
@@ -193,41 +198,41 @@ const std::vector<ProxyCall>& everyProxyCall() {
               kSession, c.list, 4, &c.count),
         PROXY(C_FindObjectsFinal, 13, (kSession), kSession),
         PROXY(C_EncryptInit, 14, MECHANISM_KEY_SENT, MECHANISM_KEY),
-        PROXY(C_Encrypt, 15, IN_OUT_SENT, IN_OUT),
-        PROXY(C_EncryptUpdate, 40, IN_OUT_SENT, IN_OUT),
-        PROXY(C_EncryptFinal, 41, OUT_SENT, OUT),
+        OUTPUT(C_Encrypt, 15, 11, IN_OUT_SENT, IN_OUT),
+        OUTPUT(C_EncryptUpdate, 40, 27, IN_OUT_SENT, IN_OUT),
+        OUTPUT(C_EncryptFinal, 41, 28, OUT_SENT, OUT),
         PROXY(C_DecryptInit, 16, MECHANISM_KEY_SENT, MECHANISM_KEY),
-        PROXY(C_Decrypt, 17, IN_OUT_SENT, IN_OUT),
-        PROXY(C_DecryptUpdate, 42, IN_OUT_SENT, IN_OUT),
-        PROXY(C_DecryptFinal, 43, OUT_SENT, OUT),
+        OUTPUT(C_Decrypt, 17, 12, IN_OUT_SENT, IN_OUT),
+        OUTPUT(C_DecryptUpdate, 42, 29, IN_OUT_SENT, IN_OUT),
+        OUTPUT(C_DecryptFinal, 43, 30, OUT_SENT, OUT),
         PROXY(C_DigestInit, 18, (kSession, kMechanism), kSession, &c.mechanism),
-        PROXY(C_Digest, 19, IN_OUT_SENT, IN_OUT),
+        OUTPUT(C_Digest, 19, 18, IN_OUT_SENT, IN_OUT),
         PROXY(C_DigestUpdate, 44, (kSession, kInput, 8), kSession, c.input, 8),
         PROXY(C_DigestKey, 45, (kSession, kKey), kSession, kKey),
-        PROXY(C_DigestFinal, 46, OUT_SENT, OUT),
+        OUTPUT(C_DigestFinal, 46, 31, OUT_SENT, OUT),
         PROXY(C_SignInit, 20, MECHANISM_KEY_SENT, MECHANISM_KEY),
-        PROXY(C_Sign, 21, IN_OUT_SENT, IN_OUT),
+        OUTPUT(C_Sign, 21, 13, IN_OUT_SENT, IN_OUT),
         PROXY(C_SignUpdate, 47, (kSession, kInput, 8), kSession, c.input, 8),
-        PROXY(C_SignFinal, 48, OUT_SENT, OUT),
+        OUTPUT(C_SignFinal, 48, 32, OUT_SENT, OUT),
         PROXY(C_SignRecoverInit, 49, MECHANISM_KEY_SENT, MECHANISM_KEY),
-        PROXY(C_SignRecover, 50, IN_OUT_SENT, IN_OUT),
+        OUTPUT(C_SignRecover, 50, 33, IN_OUT_SENT, IN_OUT),
         PROXY(C_VerifyInit, 22, MECHANISM_KEY_SENT, MECHANISM_KEY),
         // The signature is cut at its zero byte; its length is the caller's.
         PROXY(C_Verify, 23, (kSession, kInput, 8, kPin, 8), kSession, c.input, 8, c.pin, 8),
         PROXY(C_VerifyUpdate, 51, (kSession, kInput, 8), kSession, c.input, 8),
         PROXY(C_VerifyFinal, 52, (kSession, kInput, 8), kSession, c.input, 8),
         PROXY(C_VerifyRecoverInit, 53, MECHANISM_KEY_SENT, MECHANISM_KEY),
-        PROXY(C_VerifyRecover, 54, IN_OUT_SENT, IN_OUT),
-        PROXY(C_DigestEncryptUpdate, 55, IN_OUT_SENT, IN_OUT),
-        PROXY(C_DecryptDigestUpdate, 56, IN_OUT_SENT, IN_OUT),
-        PROXY(C_SignEncryptUpdate, 57, IN_OUT_SENT, IN_OUT),
-        PROXY(C_DecryptVerifyUpdate, 58, IN_OUT_SENT, IN_OUT),
+        OUTPUT(C_VerifyRecover, 54, 34, IN_OUT_SENT, IN_OUT),
+        OUTPUT(C_DigestEncryptUpdate, 55, 35, IN_OUT_SENT, IN_OUT),
+        OUTPUT(C_DecryptDigestUpdate, 56, 36, IN_OUT_SENT, IN_OUT),
+        OUTPUT(C_SignEncryptUpdate, 57, 37, IN_OUT_SENT, IN_OUT),
+        OUTPUT(C_DecryptVerifyUpdate, 58, 38, IN_OUT_SENT, IN_OUT),
         PROXY(C_GenerateKey, 59, (kSession, kMechanism, kTemplate, 2),
               kSession, &c.mechanism, c.tmpl, 2, &c.handle),
         PROXY(C_GenerateKeyPair, 60, (kSession, kMechanism, kPublic, 1, kPrivate, 1),
               kSession, &c.mechanism, &c.tmpl[0], 1, &c.tmpl[1], 1, &c.handle, &c.otherHandle),
-        PROXY(C_WrapKey, 61, (kSession, kMechanism, kKey, kOtherKey, kOutput, 16),
-              kSession, &c.mechanism, kKey, kOtherKey, c.output, &c.outputLen),
+        OUTPUT(C_WrapKey, 61, 41, (kSession, kMechanism, kKey, kOtherKey, kOutput, 16),
+              kSession, &c.mechanism, kKey, kOtherKey, c.out, c.outLen),
         {"C_UnWrapKey",  // sent under this spelling
          [](F f) {
              return f->C_UnwrapKey(kSession, &c.mechanism, kKey, c.input, 8, c.tmpl, 2, &c.handle);

@@ -74,6 +74,8 @@ struct CallerMemory {
     CK_BYTE parameter[3];
     CK_ATTRIBUTE tmpl[2];  // {CKA_LABEL, value, 5}, {CKA_TOKEN, NULL, 7}
     CK_MECHANISM mechanism;
+    CK_BYTE* out;      // output, passed by the output-buffer proxies
+    CK_ULONG* outLen;  // &outputLen, likewise
 
     // Fills every byte with a pattern, then sets the inputs above.
     void reset();
@@ -87,6 +89,9 @@ struct ProxyCall {
     CK_RV (*call)(CK_FUNCTION_LIST_PTR);
     int field;  // the request's field in Operation, 0 for none
     std::vector<Field> request;
+    // The output-buffer proxies: their answer's field in OperationResult (data,
+    // then length); their request ends with the buffer's contents and capacity.
+    int outputAnswer = 0;
 };
 
 // The 67 proxies of the function list other than C_GetFunctionList, in order.

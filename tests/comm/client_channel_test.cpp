@@ -85,7 +85,7 @@ private:
     std::vector<Outcome> outcomes_;
 };
 
-TEST_F(ClientChannelTest, HandshakeSendsVersionOneAndSecondInitKeepsConnection) {
+TEST_F(ClientChannelTest, HandshakeSendsVersionOneSecondInitKeepsConnectionDeinitCloses) {
     Bytes handshake;
     std::thread peerThread([&] {
         peer = listener.accept();
@@ -105,6 +105,16 @@ TEST_F(ClientChannelTest, HandshakeSendsVersionOneAndSecondInitKeepsConnection) 
         exchange(textBytes("ping"), replyWith(encodeFrame({101, 104, 0, 4}, textBytes("pong"))));
     EXPECT_EQ(0, o.status);
     EXPECT_EQ(textBytes("pong"), o.data());
+
+    EXPECT_EQ(0, vokpkcs11_comm_client_deinit());
+    EXPECT_EQ("Exit - Success", lines().back());
+    EXPECT_TRUE(peer.readsEndOfStream());
+    void* response;
+    uint32_t length;
+    EXPECT_EQ(2, vokpkcs11_comm_client_execute_command("x", 1, &response, &length));
+    connectClient();
+    EXPECT_EQ(0,
+              exchange(textBytes("again"), replyWith(encodeFrame({101, 104, 0, 1}, {7}))).status);
 }
 
 struct HandshakeCase {
@@ -166,18 +176,10 @@ INSTANTIATE_TEST_SUITE_P(
 
 // Every other case's listener binds the full-length abstract name, so they
 // show that the client connects with it.
-TEST_F(ClientChannelTest, ConnectFailureIsSeven) {
+TEST_F(ClientChannelTest, ConnectFailureIsSevenAndNothingWorksWithoutInit) {
     EXPECT_EQ(7, vokpkcs11_comm_client_init((id + "-nobody").c_str()));
     EXPECT_EQ("Socket connect failed", lines().back());
-}
-
-TEST_F(ClientChannelTest, SocketCreationFailureIsSix) {
-    ASSERT_TRUE(setSoftLimit(RLIMIT_NOFILE, static_cast<uint64_t>(lowestFreeDescriptor())));
-    EXPECT_EQ(6, vokpkcs11_comm_client_init(id.c_str()));
-    EXPECT_EQ("Socket create failed", lines().back());
-}
-
-TEST_F(ClientChannelTest, NothingWorksBeforeInit) {
+    log.clear();
     void* response = kUntouched;
     uint32_t length = kUntouchedLength;
     EXPECT_EQ(2, vokpkcs11_comm_client_execute_command("x", 1, &response, &length));
@@ -186,6 +188,12 @@ TEST_F(ClientChannelTest, NothingWorksBeforeInit) {
     EXPECT_EQ((std::vector<std::string>{"Entry", "Not initialized", "Entry", "Not initialized",
                                         "Entry", "Not initialized"}),
               lines());
+}
+
+TEST_F(ClientChannelTest, SocketCreationFailureIsSix) {
+    ASSERT_TRUE(setSoftLimit(RLIMIT_NOFILE, static_cast<uint64_t>(lowestFreeDescriptor())));
+    EXPECT_EQ(6, vokpkcs11_comm_client_init(id.c_str()));
+    EXPECT_EQ("Socket create failed", lines().back());
 }
 
 TEST_F(ClientChannelTest, InvalidArgumentsAreFiveAndSendNothing) {
@@ -309,19 +317,6 @@ TEST_F(ClientChannelTest, PeerGoneDuringRequestPayloadIsElevenWithoutSigpipe) {
     });
     EXPECT_EQ(11, o.status);
     EXPECT_EQ("Client send data failed 11", lines().back());
-}
-
-TEST_F(ClientChannelTest, DeinitClosesAndInitConnectsAgain) {
-    connectClient();
-    EXPECT_EQ(0, vokpkcs11_comm_client_deinit());
-    EXPECT_EQ("Exit - Success", lines().back());
-    EXPECT_TRUE(peer.readsEndOfStream());
-    void* response;
-    uint32_t length;
-    EXPECT_EQ(2, vokpkcs11_comm_client_execute_command("x", 1, &response, &length));
-    connectClient();
-    EXPECT_EQ(0,
-              exchange(textBytes("again"), replyWith(encodeFrame({101, 104, 0, 1}, {7}))).status);
 }
 
 TEST_F(ClientChannelTest, SignalDuringReceiveIsRetried) {
