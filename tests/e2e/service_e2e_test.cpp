@@ -250,7 +250,9 @@ protected:
 };
 
 TEST_F(ServiceE2eTest, ServesEveryStepToANativeClientAndStopsWhenItsInputEnds) {
+    EXPECT_EQ(usage(), 0);  // no request yet
     expectEveryStepPasses();
+    EXPECT_GT(usage(), 0);  // the last answer's time
 
     host_->closeInput();
     EXPECT_EQ(host_->waitForLine("stopped"), "stopped " + serverId_) << host_->transcript();
