@@ -14,6 +14,7 @@ import java.lang.reflect.Method;
 import java.lang.reflect.Modifier;
 import java.util.ArrayList;
 import java.util.Arrays;
+import java.util.Collections;
 import java.util.List;
 import java.util.Set;
 import java.util.TreeSet;
@@ -286,7 +287,8 @@ class Pkcs11MethodsTest {
             call("C_SignInit", () -> p11.C_SignInit(SESSION, hmac, HMAC)),
             row("C_SignEncryptUpdate", 2, () -> p11.C_SignEncryptUpdate(SESSION, BLOCK),
                 r -> isBytes(cipher).accept(r), "first:pEncryptedPart 1 0 - 0"),
-            // C_Sign (the operation still runs) offers 512 bytes, then asks again with the length the module names.
+            // C_Sign (its operation still runs) offers 512 bytes, then asks again with the
+            // length the module names.
             row("C_Sign", 2, () -> {
                 NativeProbe.controlVendor(vendor, "fake_vendor_set_signature_length", 600);
                 return p11.C_Sign(SESSION, DATA);
@@ -370,7 +372,9 @@ class Pkcs11MethodsTest {
             assertEquals(row.fails, result instanceof PKCS11Exception, where + result);
             row.check.accept(result);
         }
-        assertEquals(nativeMethodNames(), inTable, "a row for every native method");
+        Set<String> names = new TreeSet<>();
+        nativeMethods().forEach(m -> names.add(m.getName()));
+        assertEquals(names, inTable, "a row for every native method");
     }
 
     @Test
@@ -399,7 +403,8 @@ class Pkcs11MethodsTest {
 
     @Test
     void logTextsStayAsTheyWere() throws Exception {
-        openUserSession();
+        p11.C_Initialize(null);
+        p11.C_OpenSession(SLOT, CKF_RW_SERIAL, null);
         p11.C_DigestInit(SESSION, new CK_MECHANISM(0x250));
         NativeProbe.captureLog();
         byte[] first = p11.C_Digest(SESSION, DATA);
@@ -423,12 +428,6 @@ class Pkcs11MethodsTest {
 
     // ---- Helpers ----------------------------------------------------------------
 
-    private static void openUserSession() throws PKCS11Exception {
-        p11.C_Initialize(null);
-        assertEquals(SESSION, p11.C_OpenSession(SLOT, CKF_RW_SERIAL, null));
-        p11.C_Login(SESSION, 1, chars("1234"));
-    }
-
     private static List<Method> nativeMethods() {
         List<Method> methods = new ArrayList<>();
         for (Method m : Pkcs11.class.getDeclaredMethods()) {
@@ -436,16 +435,8 @@ class Pkcs11MethodsTest {
                 methods.add(m);
             }
         }
+        assertEquals(67, methods.size());
         return methods;
-    }
-
-    private static Set<String> nativeMethodNames() {
-        Set<String> names = new TreeSet<>();
-        for (Method m : nativeMethods()) {
-            names.add(m.getName());
-        }
-        assertEquals(67, names.size());
-        return names;
     }
 
     /** An argument that a method touching it would fail on with another exception. */
@@ -511,10 +502,6 @@ class Pkcs11MethodsTest {
     }
 
     private static String repeat(String text, int times) {
-        StringBuilder all = new StringBuilder();
-        for (int i = 0; i < times; i++) {
-            all.append(text);
-        }
-        return all.toString();
+        return String.join("", Collections.nCopies(times, text));
     }
 }
