@@ -14,22 +14,13 @@
 //       prints "connected", then for each function (C_Initialize, C_GetInfo)
 //       waits for a line on standard input, prints "calling <function>", makes
 //       the call and prints "<function> rv=0x<rv> ms=<elapsed>".
-//   vok_e2e_client <library> <serverId> stall
-//       without the library: sends the header of a request and half its
-//       payload by hand, prints "stalled" once the service has read all of it
-//       and waits for standard input to end.
 
 #include <dlfcn.h>
-#include <linux/sockios.h>
-#include <sys/ioctl.h>
-#include <sys/socket.h>
-#include <sys/un.h>
 #include <unistd.h>
 
 #include <chrono>
 #include <cstdint>
 #include <cstdio>
-#include <cstring>
 #include <iostream>
 #include <random>
 #include <string>
@@ -212,69 +203,6 @@ int rounds(const Library& library, int count, CK_RV initialized, CK_RV alsoFine)
     return wrong == 0 ? 0 : 1;
 }
 
-// ---- A request that never completes ---------------------------------------------
-
-bool sendAll(int fd, const void* data, size_t size) {
-    const auto* p = static_cast<const char*>(data);
-    while (size > 0) {
-        ssize_t sent = send(fd, p, size, MSG_NOSIGNAL);
-        if (sent <= 0) return false;
-        p += sent;
-        size -= static_cast<size_t>(sent);
-    }
-    return true;
-}
-
-// The service's socket: an abstract name made of the id from its second
-// character on, zero-padded to the full address length.
-int connectRaw(const std::string& serverId) {
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    std::strncpy(address.sun_path, serverId.c_str(), sizeof address.sun_path - 1);
-    address.sun_path[0] = 0;
-    for (int attempt = 0; attempt < 100; ++attempt) {
-        int fd = socket(AF_UNIX, SOCK_STREAM, 0);
-        if (fd < 0) return -1;
-        if (connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address) == 0) return fd;
-        close(fd);
-        std::this_thread::sleep_for(std::chrono::milliseconds(100));
-    }
-    return -1;
-}
-
-int stall(const std::string& serverId) {
-    int fd = connectRaw(serverId);
-    if (fd < 0) {
-        std::cout << "FAIL connect" << std::endl;
-        return 2;
-    }
-    // A PKCS#11 command announcing 16 bytes of which only 8 ever come: the
-    // service has taken the request in and waits for the rest.
-    const int32_t header[4] = {101, 103, 0, 16};
-    const char half[8] = {0};
-    if (!sendAll(fd, header, sizeof header) || !sendAll(fd, half, sizeof half)) {
-        std::cout << "FAIL send" << std::endl;
-        return 2;
-    }
-    // Nothing left unread in the send queue means the service has read the
-    // header, recorded the request time and waits inside the payload.
-    int unread = -1;
-    for (int attempt = 0; attempt < 3000 && unread != 0; ++attempt) {
-        if (ioctl(fd, SIOCOUTQ, &unread) != 0) break;
-        if (unread != 0) std::this_thread::sleep_for(std::chrono::milliseconds(10));
-    }
-    if (unread != 0) {
-        std::cout << "FAIL unread " << unread << std::endl;
-        return 2;
-    }
-    std::cout << "stalled" << std::endl;
-    std::string line;
-    while (std::getline(std::cin, line)) {
-    }
-    close(fd);
-    return 0;
-}
-
 }  // namespace
 
 int main(int argc, char** argv) {
@@ -282,12 +210,10 @@ int main(int argc, char** argv) {
     if (args.size() < 3) {
         std::cerr << "usage: vok_e2e_client <library> <serverId> steps [--already-initialized]\n"
                      "       vok_e2e_client <library> <serverId> call <function>...\n"
-                     "       vok_e2e_client <library> <serverId> stall\n"
                      "       vok_e2e_client <library> <serverId> soak <rounds>\n";
         return 2;
     }
     const std::string& mode = args[2];
-    if (mode == "stall") return stall(args[1]);
     if (mode == "steps") {
         const CK_RV initialized = args.size() > 3 && args[3] == "--already-initialized"
                                       ? CKR_CRYPTOKI_ALREADY_INITIALIZED
