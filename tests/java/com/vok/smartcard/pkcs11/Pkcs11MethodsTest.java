@@ -383,20 +383,12 @@ class Pkcs11MethodsTest {
         Pkcs11 loose = new Pkcs11();
         int before = NativeProbe.vendorCalls(vendor).length;
         for (Method method : nativeMethods()) {
-            Class<?>[] types = method.getParameterTypes();
-            Object[] args = new Object[types.length];
-            for (int i = 0; i < types.length; i++) {
-                args[i] = poison(types[i]);
-            }
-            try {
-                method.invoke(loose, args);
-                fail(method.getName() + " returned");
-            } catch (InvocationTargetException e) {
-                Throwable thrown = e.getCause();
-                assertEquals(PKCS11RuntimeException.class, thrown.getClass(), method.getName());
-                assertEquals("This object is not connected to a module.", thrown.getMessage(),
-                        method.getName());
-            }
+            Object[] args = Arrays.stream(method.getParameterTypes()).map(t -> poison(t)).toArray();
+            Throwable thrown = assertThrows(InvocationTargetException.class,
+                    () -> method.invoke(loose, args), method.getName()).getCause();
+            assertEquals(PKCS11RuntimeException.class, thrown.getClass(), method.getName());
+            assertEquals("This object is not connected to a module.", thrown.getMessage(),
+                    method.getName());
         }
         assertEquals(before, NativeProbe.vendorCalls(vendor).length);
     }
