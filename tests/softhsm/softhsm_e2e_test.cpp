@@ -1,7 +1,9 @@
 // The real path, run by scripts/demo as its client: this process is the
 // application calling the exported C_ proxies, and the Java service host
 // serves SoftHSM2 through the module bridge across the socket. What the token
-// produces is checked with OpenSSL, one case per mechanism family.
+// produces is checked with OpenSSL. The signatures (ECDSA, RSA) and AES-CBC-PAD
+// are the native demo client's (the demo_native test), here the parameters
+// that hold pointers and digests of the edge sizes.
 //
 //   softhsm_e2e_tests [gtest flags] <proxy library> <server id> <user PIN> <file>
 
@@ -24,29 +26,6 @@ std::unique_ptr<ProxyLibrary> proxy;
 std::unique_ptr<Session> session;
 
 Bytes bytes(const std::string& text) { return Bytes(text.begin(), text.end()); }
-
-// SoftHSM2 2.6 signs with plain CKM_ECDSA only: the token signs the SHA-256
-// digest, which OpenSSL's ECDSA-SHA256 verification computes itself.
-TEST(SoftHsmThroughProxy, EcdsaP256SignatureVerifiesWithOpenSsl) {
-    CK_OBJECT_HANDLE publicKey, privateKey;
-    session->generateEcP256(&publicKey, &privateKey);
-    const Bytes data = bytes("ECDSA over SHA-256, made on the token");
-    const Bytes signature = session->sign({CKM_ECDSA, nullptr, 0}, privateKey, sha256(data));
-    const Bytes point = session->attribute(publicKey, CKA_EC_POINT);
-    EXPECT_TRUE(verifyEcdsaP256Sha256(point, data, signature)) << hex(point);
-    EXPECT_FALSE(verifyEcdsaP256Sha256(point, bytes("another message"), signature));
-}
-
-TEST(SoftHsmThroughProxy, AesCbcPadCiphertextDecryptsWithOpenSsl) {
-    const CK_OBJECT_HANDLE key = session->generateAes256(true);
-    Bytes iv = {0, 1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 13, 14, 15};
-    const Bytes plain = bytes("forty-one bytes of plain text to encrypt.");
-    const Bytes cipher = session->encrypt({CKM_AES_CBC_PAD, iv.data(), iv.size()}, key, plain);
-    EXPECT_EQ(cipher.size(), 48u);
-    Bytes decrypted;
-    ASSERT_TRUE(decryptAes256CbcPad(session->attribute(key, CKA_VALUE), iv, cipher, &decrypted));
-    EXPECT_EQ(decrypted, plain);
-}
 
 // Parameters that hold pointers reach the token by value: GCM's IV and AAD,
 // the peer's point of ECDH. (SoftHSM2 2.6 takes OAEP with SHA-1 and no label
