@@ -16,18 +16,23 @@ import org.junit.jupiter.api.BeforeAll;
 import org.junit.jupiter.api.Test;
 
 /**
- * connect and disconnect in a process that takes no role: modules connected without a server
- * id, or under a foreign library name, are used in the process itself.
+ * connect and disconnect, with a server that this same process runs: only the library's own
+ * bare name opens the channel; modules connected under any other name, or without a server
+ * id, are used in the process itself.
  */
 class ConnectTest {
     private static final String GETTER = Pkcs11.DEFAULT_FUNCTION_LIST_NAME;
+    private static final String SERVER_ID = TestModules.uniqueServerId();
 
     private final List<Pkcs11> objects = new ArrayList<>();
     private int nodesBefore;
 
     @BeforeAll
-    static void initializeLibrary() {
-        new Pkcs11().initializeLibrary();
+    static void startServer() throws Exception {
+        Pkcs11 service = new Pkcs11();
+        service.initializeLibrary();
+        service.connect(TestModules.fakeVendor(), GETTER, SERVER_ID, Pkcs11.ROLE_SERVER);
+        TestModules.awaitListening(SERVER_ID);
     }
 
     private Pkcs11 newPkcs11() {
@@ -47,17 +52,35 @@ class ConnectTest {
     }
 
     @Test
-    void connectingTwiceKeepsOneNodeWithTheNewerEntry() throws Exception {
+    void theLibrarysOwnNameOpensTheChannelAndDisconnectClosesIt() throws Exception {
+        for (String name : new String[] {TestModules.fakeVendor(), TestModules.wrapperPath()}) {
+            Pkcs11 other = newPkcs11();
+            other.connect(name, GETTER, SERVER_ID, Pkcs11.ROLE_CLIENT);
+            assertEquals(SERVER_ID, NativeProbe.moduleNameOf(other));
+            assertEquals(TestModules.ALL_ONES, NativeProbe.channelGetInfo(), name);
+        }
+        Pkcs11 client = newPkcs11();
+        client.connect(Pkcs11.WRAPPER_LIBRARY_NAME, GETTER, SERVER_ID, Pkcs11.ROLE_CLIENT);
+        // Answered by the service's module, which nobody has initialised; the object's module
+        // is the proxy, not the vendor.
+        assertEquals(TestModules.CKR_CRYPTOKI_NOT_INITIALIZED, NativeProbe.channelGetInfo());
+        assertEquals(TestModules.CKR_CRYPTOKI_NOT_INITIALIZED, NativeProbe.moduleGetInfo(client));
+        client.disconnect();
+        assertEquals(TestModules.ALL_ONES, NativeProbe.channelGetInfo());
+    }
+
+    /** Unloading the module is DisconnectRace's; here the node, and disconnects that find none. */
+    @Test
+    void connectingTwiceKeepsOneNodeWithTheNewerEntryAndDisconnectRemovesIt() throws Exception {
         Pkcs11 pkcs11 = newPkcs11();
-        // Foreign library names open no channel, whatever the server id.
         pkcs11.connect(TestModules.fakeVendor(), GETTER, "Xfirst", Pkcs11.ROLE_CLIENT);
         pkcs11.connect(TestModules.fakeVendor(), GETTER, "Xsecond", Pkcs11.ROLE_CLIENT);
-
         assertEquals(nodesBefore + 1, NativeProbe.nodeCount());
         assertEquals("Xsecond", NativeProbe.moduleNameOf(pkcs11));
-
         pkcs11.disconnect();
         assertFalse(NativeProbe.isConnected(pkcs11));
+        pkcs11.disconnect();
+        newPkcs11().disconnect();
         assertEquals(nodesBefore, NativeProbe.nodeCount());
     }
 
@@ -65,42 +88,43 @@ class ConnectTest {
     void aNullServerIdRegistersTheModuleWithoutANameAndOpensNoChannel() throws Exception {
         Pkcs11 server = newPkcs11();
         server.connect(TestModules.fakeVendor(), GETTER, null, Pkcs11.ROLE_SERVER);
-        assertTrue(NativeProbe.isConnected(server));
         assertNull(NativeProbe.moduleNameOf(server));
         assertTrue(NativeProbe.hasFunctionList(server));
-
         Pkcs11 client = newPkcs11();
         client.connect(Pkcs11.WRAPPER_LIBRARY_NAME, GETTER, null, Pkcs11.ROLE_CLIENT);
         assertNull(NativeProbe.moduleNameOf(client));
         assertEquals(TestModules.ALL_ONES, NativeProbe.channelGetInfo());
     }
 
+    /** The loader's texts or the missing name, and nothing left registered or loaded. */
     @Test
-    void aMissingLibraryThrowsTheLoadersText() {
-        Pkcs11 pkcs11 = newPkcs11();
-        String missing = "/nonexistent/libvokmissing.so";
-        IOException e = assertThrows(IOException.class,
-                () -> pkcs11.connect(missing, GETTER, null, Pkcs11.ROLE_CLIENT));
-        assertEquals(missing + ": cannot open shared object file: No such file or directory",
-                e.getMessage());
-        assertFalse(NativeProbe.isConnected(pkcs11));
-        assertEquals(nodesBefore, NativeProbe.nodeCount());
-    }
-
-    @Test
-    void aMissingGetterThrowsTheLoadersTextAndUnloadsTheLibrary() throws Exception {
-        Pkcs11 pkcs11 = newPkcs11();
+    void aConnectWithoutModuleOrGetterThrowsAndKeepsNothing() throws Exception {
         String module = TestModules.fakeVendorCopy();
-        NativeProbe.captureLog();
-        IOException e = assertThrows(IOException.class,
-                () -> pkcs11.connect(module, "C_NoSuchGetter", "Xid", Pkcs11.ROLE_CLIENT));
-        assertEquals(module + ": undefined symbol: C_NoSuchGetter", e.getMessage());
-        String[] log = NativeProbe.takeLog("[native]");
-        assertArrayEquals(new String[] {"3|C_GetFunctionList load failed",
-            "3|" + module + ": undefined symbol: C_NoSuchGetter..."},
-                Arrays.copyOfRange(log, log.length - 2, log.length));
-        assertFalse(NativeProbe.isConnected(pkcs11));
-        assertFalse(TestModules.isMapped(module), "the failed connect kept the library loaded");
+        String missing = "/nonexistent/libvokmissing.so";
+        String noFile = missing + ": cannot open shared object file: No such file or directory";
+        String noGetter = module + ": undefined symbol: C_NoSuchGetter";
+        Object[][] rows = {  // library, getter, exception, message, the log's last lines
+            {missing, GETTER, IOException.class, noFile, new String[] {"3|" + noFile + "..."}},
+            {module, "C_NoSuchGetter", IOException.class, noGetter,
+                new String[] {"3|C_GetFunctionList load failed", "3|" + noGetter + "..."}},
+            {null, GETTER, NullPointerException.class, "connect: libraryName must not be null",
+                new String[0]},
+            {module, null, NullPointerException.class,
+                "connect: functionListName must not be null", new String[0]}};
+        for (Object[] row : rows) {
+            Pkcs11 pkcs11 = newPkcs11();
+            NativeProbe.captureLog();
+            Throwable e = assertThrows(Exception.class, () -> pkcs11.connect((String) row[0],
+                    (String) row[1], "Xid", Pkcs11.ROLE_CLIENT));
+            assertEquals(row[2], e.getClass());
+            assertEquals(row[3], e.getMessage());
+            String[] log = NativeProbe.takeLog("[native]");
+            String[] last = (String[]) row[4];
+            assertArrayEquals(last, Arrays.copyOfRange(log, log.length - last.length, log.length));
+            assertFalse(NativeProbe.isConnected(pkcs11));
+            assertEquals(nodesBefore, NativeProbe.nodeCount());
+            assertFalse(TestModules.isMapped(module), "a failed connect kept the library loaded");
+        }
     }
 
     @Test
@@ -108,14 +132,12 @@ class ConnectTest {
         String module = TestModules.fakeVendor();
         long vendor = NativeProbe.openVendor(module);
         try {
-            NativeProbe.setNextVendorRv(
-                    vendor, "C_GetFunctionList", TestModules.CKR_FUNCTION_FAILED);
+            NativeProbe.setNextVendorRv(vendor, "C_GetFunctionList", 0x6);  // FUNCTION_FAILED
             Pkcs11 pkcs11 = newPkcs11();
             PKCS11Exception e = assertThrows(PKCS11Exception.class,
                     () -> pkcs11.connect(module, GETTER, "Xid", Pkcs11.ROLE_CLIENT));
-            assertEquals(TestModules.CKR_FUNCTION_FAILED, e.getErrorCode());
+            assertEquals(0x6, e.getErrorCode());
             assertEquals("CKR 0x0000000000000006", e.getMessage());
-
             assertTrue(NativeProbe.isConnected(pkcs11));
             assertFalse(NativeProbe.hasFunctionList(pkcs11));
             pkcs11.disconnect();
@@ -123,34 +145,6 @@ class ConnectTest {
         } finally {
             NativeProbe.closeVendor(vendor);
         }
-    }
-
-    @Test
-    void nullLibraryOrGetterNamesThrowNullPointerException() {
-        Pkcs11 pkcs11 = newPkcs11();
-        NullPointerException noLibrary = assertThrows(NullPointerException.class,
-                () -> pkcs11.connect(null, GETTER, "Xid", Pkcs11.ROLE_CLIENT));
-        assertTrue(noLibrary.getMessage().contains("libraryName"), noLibrary.getMessage());
-        NullPointerException noGetter = assertThrows(NullPointerException.class,
-                () -> pkcs11.connect(TestModules.fakeVendor(), null, "Xid", Pkcs11.ROLE_CLIENT));
-        assertTrue(noGetter.getMessage().contains("functionListName"), noGetter.getMessage());
-        assertEquals(nodesBefore, NativeProbe.nodeCount());
-    }
-
-    @Test
-    void disconnectUnloadsTheModuleAndASecondDisconnectIsHarmless() throws Exception {
-        Pkcs11 pkcs11 = newPkcs11();
-        String module = TestModules.fakeVendorCopy();
-        pkcs11.connect(module, GETTER, null, Pkcs11.ROLE_CLIENT);
-        assertTrue(TestModules.isMapped(module));
-
-        pkcs11.disconnect();
-        assertFalse(TestModules.isMapped(module));
-        assertFalse(NativeProbe.isConnected(pkcs11));
-
-        pkcs11.disconnect();
-        newPkcs11().disconnect();
-        assertEquals(nodesBefore, NativeProbe.nodeCount());
     }
 
     @Test

@@ -11,7 +11,6 @@ import java.util.Random;
 
 /** Paths the build hands to the tests, server ids, and what /proc tells about them. */
 final class TestModules {
-    static final long CKR_FUNCTION_FAILED = 0x6L;
     static final long CKR_CRYPTOKI_NOT_INITIALIZED = 0x190L;
     /** What a proxy returns when the channel fails. */
     static final long ALL_ONES = -1L;
