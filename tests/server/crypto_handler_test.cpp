@@ -267,105 +267,10 @@ TEST_P(MechanismRebuild, ParameterOfTheStatedLengthNeverNull) {
 INSTANTIATE_TEST_SUITE_P(Handlers, MechanismRebuild, ::testing::ValuesIn(kInitRows),
                          [](const auto& info) { return std::string(info.param.command); });
 
-// ---- C_Verify, key, random and slot-event handlers --------------------------------------------
-
-struct KeyRow {
-    const char* command;
-    Fill fill;
-    std::vector<std::string> lines;
-    std::function<void(Result&)> expect;  // the answer's sub-message
-};
-void PrintTo(const KeyRow& row, std::ostream* os) { *os << row.command; }
-
 void label(google::protobuf::RepeatedPtrField<pkcs11::CK_ATTRIBUTE>* list, const std::string& value,
            CK_ULONG length) {
     setAttribute(list->Add(), CKA_LABEL, value, length);
 }
-
-// The module fails at once: the answer carries the service's own buffers as
-// they were passed, and handles as they stand.
-const KeyRow kKeyRows[] = {
-    // Deliberately: the signature sent never reaches the module, which checks
-    // zeros of its length, and those come back.
-    {"C_Verify",
-     [](auto& op) {
-         auto* m = op.mutable_verify();
-         m->set_pdata("abc"), m->set_uldatalen(4), m->set_psignature("sigX");
-         m->set_ulsignaturelen(4);
-     },
-     {"pData 0 0 61626300 0", "ulDataLen 1 4 - 0", "pSignature 0 0 00000000 0",
-      "ulSignatureLen 1 4 - 0"},
-     [](Result& r) {
-         r.mutable_verifyres()->set_psignature(std::string(4, '\0'));
-         r.mutable_verifyres()->set_ulsignaturelen(4);
-     }},
-    {"C_WrapKey",
-     [](auto& op) {
-         auto* m = op.mutable_wrapkey();
-         m->set_hwrappingkey(5), m->set_hkey(6), m->set_pwrappedkey("ab");
-         m->set_pulwrappedkeylen(4);
-     },
-     {"hWrappingKey 1 5 - 0", "hKey 1 6 - 0", "pWrappedKey 0 0 61620000 0",
-      "pulWrappedKeyLen 0 4 - 0"},
-     [](Result& r) {
-         r.mutable_wrapkeyres()->set_pwrappedkey(std::string("ab\0\0", 4));
-         r.mutable_wrapkeyres()->set_pulwrappedkeylen(4);
-     }},
-    {"C_GenerateKeyPair",
-     [](auto& op) {
-         auto* m = op.mutable_generatekeypair();
-         label(m->mutable_ppublickeytemplate(), "pub", 3), m->set_ulpublickeyattributecount(1);
-         label(m->mutable_pprivatekeytemplate(), "pr", 3), m->set_ulprivatekeyattributecount(2);
-     },
-     {"pPublicKeyTemplate 0 0 - 1 3 0 3 707562", "ulPublicKeyAttributeCount 1 1 - 0",
-      "pPrivateKeyTemplate 0 0 - 2 3 0 3 707200 0 1 0 -", "ulPrivateKeyAttributeCount 1 2 - 0"},
-     [](Result& r) {
-         r.mutable_generatekeypairres()->set_phpublickey(0);
-         r.mutable_generatekeypairres()->set_phprivatekey(0);
-     }},
-    {"C_GenerateRandom",
-     [](auto& op) {
-         op.mutable_generaterandom()->set_randomdata("ab");
-         op.mutable_generaterandom()->set_ulrandomlen(4);
-     },
-     {"RandomData 0 0 61620000 0", "ulRandomLen 1 4 - 0"},
-     [](Result& r) {
-         r.mutable_generaterandomres()->set_randomdata(std::string("ab\0\0", 4));
-         r.mutable_generaterandomres()->set_ulrandomlen(4);
-     }},
-    {"C_SeedRandom",
-     [](auto& op) {
-         op.mutable_seedrandom()->set_pseed("seedXX"), op.mutable_seedrandom()->set_ulseedlen(4);
-     },
-     {"pSeed 0 0 73656564 0", "ulSeedLen 1 4 - 0"},
-     [](Result& r) {
-         r.mutable_seedrandomres()->set_pseed("seed"), r.mutable_seedrandomres()->set_ulseedlen(4);
-     }},
-    {"C_WaitForSlotEvent",
-     [](auto& op) {
-         op.mutable_waitforslotevent()->set_flags(CKF_DONT_BLOCK);
-         op.mutable_waitforslotevent()->set_presearved(std::string(8, '\x7f'));
-     },
-     {"flags 1 1 - 0", "pSlot 0 0 - 0", "pReserved 1 0 - 0"},
-     [](Result& r) { r.mutable_waitforsloteventres()->set_pslot(0); }},
-};
-
-class KeyHandlers : public FakeModuleTest, public ::testing::WithParamInterface<KeyRow> {};
-
-TEST_P(KeyHandlers, ModuleReceivesAndAnswerExactly) {
-    const KeyRow& row = GetParam();
-    ASSERT_EQ(CKR_OK, fake_vendor_set_next_rv(row.command, kFailure));
-    const std::string answer = frameOf(row.command).handler(requestBytes(row.command, row.fill));
-    EXPECT_THAT(received(row.command), IsSupersetOf(row.lines));
-    Result expected;
-    expected.set_name(row.command);
-    expected.set_result(kFailure);
-    row.expect(expected);
-    EXPECT_EQ(hex(expected.SerializeAsString()), hex(answer));
-}
-
-INSTANTIATE_TEST_SUITE_P(Handlers, KeyHandlers, ::testing::ValuesIn(kKeyRows),
-                         [](const auto& info) { return std::string(info.param.command); });
 
 // ---- Log lines ------------------------------------------------------------------------------
 

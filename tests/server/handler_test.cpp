@@ -6,6 +6,7 @@
 #include <algorithm>
 #include <cstddef>
 #include <cstring>
+#include <functional>
 #include <optional>
 #include <ostream>
 #include <string>
@@ -64,7 +65,12 @@ struct ReceiveRow {
     const char* command;
     Fill fill;
     std::vector<std::string> lines;
+    // Set: the module fails at once, and the answer is exactly this (with name
+    // and result): the service's own buffers as passed, handles as they stand.
+    std::function<void(Result&)> answer = {};
 };
+
+constexpr CK_RV kFailure = CKR_VENDOR_DEFINED | 0x5a;
 
 void PrintTo(const ReceiveRow& row, std::ostream* os) { *os << row.label; }
 
@@ -145,6 +151,70 @@ const ReceiveRow kReceiveRows[] = {
      [](auto& op) { op.mutable_findobj()->set_hsession(1); },
      {"hSession 1 1 - 0", "phObject 0 0 - 0", "ulMaxObjectCount 1 0 - 0",
       "pulObjectCount 0 0 - 0"}},
+    // Deliberately: the signature sent never reaches the module, which checks
+    // zeros of its length, and those come back.
+    {"VerifyFailingStillAnswers", "C_Verify",
+     [](auto& op) {
+         auto* m = op.mutable_verify();
+         m->set_pdata("abc"), m->set_uldatalen(4), m->set_psignature("sigX");
+         m->set_ulsignaturelen(4);
+     },
+     {"pData 0 0 61626300 0", "ulDataLen 1 4 - 0", "pSignature 0 0 00000000 0",
+      "ulSignatureLen 1 4 - 0"},
+     [](Result& r) {
+         r.mutable_verifyres()->set_psignature(std::string(4, '\0'));
+         r.mutable_verifyres()->set_ulsignaturelen(4);
+     }},
+    {"WrapKeyFailingStillAnswers", "C_WrapKey",
+     [](auto& op) {
+         auto* m = op.mutable_wrapkey();
+         m->set_hwrappingkey(5), m->set_hkey(6), m->set_pwrappedkey("ab");
+         m->set_pulwrappedkeylen(4);
+     },
+     {"hWrappingKey 1 5 - 0", "hKey 1 6 - 0", "pWrappedKey 0 0 61620000 0",
+      "pulWrappedKeyLen 0 4 - 0"},
+     [](Result& r) {
+         r.mutable_wrapkeyres()->set_pwrappedkey(std::string("ab\0\0", 4));
+         r.mutable_wrapkeyres()->set_pulwrappedkeylen(4);
+     }},
+    {"GenerateKeyPairFailingStillAnswers", "C_GenerateKeyPair",
+     [](auto& op) {
+         auto* m = op.mutable_generatekeypair();
+         attribute(m->mutable_ppublickeytemplate(), CKA_LABEL, "pub", 3);
+         attribute(m->mutable_pprivatekeytemplate(), CKA_LABEL, "pr", 3);
+         m->set_ulpublickeyattributecount(1), m->set_ulprivatekeyattributecount(2);
+     },
+     {"pPublicKeyTemplate 0 0 - 1 3 0 3 707562", "ulPublicKeyAttributeCount 1 1 - 0",
+      "pPrivateKeyTemplate 0 0 - 2 3 0 3 707200 0 1 0 -", "ulPrivateKeyAttributeCount 1 2 - 0"},
+     [](Result& r) {
+         r.mutable_generatekeypairres()->set_phpublickey(0);
+         r.mutable_generatekeypairres()->set_phprivatekey(0);
+     }},
+    {"GenerateRandomFailingStillAnswers", "C_GenerateRandom",
+     [](auto& op) {
+         op.mutable_generaterandom()->set_randomdata("ab");
+         op.mutable_generaterandom()->set_ulrandomlen(4);
+     },
+     {"RandomData 0 0 61620000 0", "ulRandomLen 1 4 - 0"},
+     [](Result& r) {
+         r.mutable_generaterandomres()->set_randomdata(std::string("ab\0\0", 4));
+         r.mutable_generaterandomres()->set_ulrandomlen(4);
+     }},
+    {"SeedRandomFailingStillAnswers", "C_SeedRandom",
+     [](auto& op) {
+         op.mutable_seedrandom()->set_pseed("seedXX"), op.mutable_seedrandom()->set_ulseedlen(4);
+     },
+     {"pSeed 0 0 73656564 0", "ulSeedLen 1 4 - 0"},
+     [](Result& r) {
+         r.mutable_seedrandomres()->set_pseed("seed"), r.mutable_seedrandomres()->set_ulseedlen(4);
+     }},
+    {"WaitForSlotEventFailingStillAnswers", "C_WaitForSlotEvent",
+     [](auto& op) {
+         op.mutable_waitforslotevent()->set_flags(CKF_DONT_BLOCK);
+         op.mutable_waitforslotevent()->set_presearved(std::string(8, '\x7f'));
+     },
+     {"flags 1 1 - 0", "pSlot 0 0 - 0", "pReserved 1 0 - 0"},
+     [](Result& r) { r.mutable_waitforsloteventres()->set_pslot(0); }},
 };
 
 class ModuleReceives : public FakeModuleTest, public ::testing::WithParamInterface<ReceiveRow> {};
@@ -152,9 +222,17 @@ class ModuleReceives : public FakeModuleTest, public ::testing::WithParamInterfa
 TEST_P(ModuleReceives, WhatTheRequestSays) {
     const ReceiveRow& row = GetParam();
     const FrameRow& frame = frameOf(row.command);
-    frame.handler(requestBytes(row.command, row.fill));
+    if (row.answer) {
+        ASSERT_EQ(CKR_OK, fake_vendor_set_next_rv(frame.moduleFunction, kFailure));
+    }
+    const std::string answer = frame.handler(requestBytes(row.command, row.fill));
     EXPECT_THAT(received(frame.moduleFunction), IsSupersetOf(row.lines))
         << fakevendor::lastCall(frame.moduleFunction);
+    if (!row.answer) return;
+    Result expected;
+    expected.set_name(row.command), expected.set_result(kFailure);
+    row.answer(expected);
+    EXPECT_EQ(hex(expected.SerializeAsString()), hex(answer));
 }
 
 INSTANTIATE_TEST_SUITE_P(Handlers, ModuleReceives, ::testing::ValuesIn(kReceiveRows),
