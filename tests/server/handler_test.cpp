@@ -241,7 +241,6 @@ INSTANTIATE_TEST_SUITE_P(Handlers, ModuleReceives, ::testing::ValuesIn(kReceiveR
 // ---- The exact answer ---------------------------------------------------------
 
 constexpr CK_OBJECT_HANDLE kLabelOne = FAKE_VENDOR_FIRST_OBJECT_HANDLE;  // "label-one"
-constexpr CK_OBJECT_HANDLE kSensitiveKey = FAKE_VENDOR_FIRST_OBJECT_HANDLE + 2;
 constexpr CK_SESSION_HANDLE kSession = 1;
 
 struct AnswerRow {
@@ -322,6 +321,13 @@ void unavailableInSet(CK_FUNCTION_LIST& l) {
     l.C_SetAttributeValue = [](CK_SESSION_HANDLE, CK_OBJECT_HANDLE, CK_ATTRIBUTE_PTR t,
                                CK_ULONG n) { return markUnavailable(t, n); };
 }
+void sensitiveValue(CK_FUNCTION_LIST& l) {
+    l.C_GetAttributeValue = [](CK_SESSION_HANDLE, CK_OBJECT_HANDLE, CK_ATTRIBUTE_PTR t,
+                               CK_ULONG n) -> CK_RV {
+        markUnavailable(t, n);
+        return CKR_ATTRIBUTE_SENSITIVE;
+    };
+}
 
 const std::string kVendor = pad("Vok test vendor", 32);
 
@@ -382,9 +388,9 @@ const AnswerRow kAnswerRows[] = {
          attribute(r.mutable_attvalueres()->mutable_attribute(), CKA_LABEL, std::nullopt, 9);
          r.mutable_attvalueres()->set_ulcount(1);
      }},
-    {"SensitiveAttributeComesBackAsTypeOnly", nullptr, "C_GetAttributeValue",
+    {"SensitiveAttributeComesBackAsTypeOnly", sensitiveValue, "C_GetAttributeValue",
      [](auto& op) {
-         getLabel(op, kSensitiveKey, "xxxxxxxxxxxxxxxx", 16);
+         getLabel(op, kLabelOne, "xxxxxxxxxxxxxxxx", 16);
          op.mutable_attvalue()->mutable_attribute(0)->set_type(CKA_VALUE);
      },
      CKR_ATTRIBUTE_SENSITIVE,
@@ -450,8 +456,8 @@ const AnswerRow kAnswerRows[] = {
      [](Result& r) { r.mutable_findobjres()->set_pulobjectcount(4); }},
 };
 
-// Slot 1 holds "label-one", "label-two" and a sensitive key, seen through a
-// logged-in read/write session; there are two slots.
+// Slot 1 holds "label-one", seen through a logged-in read/write session;
+// there are two slots.
 class PreparedToken : public FakeModuleTest {
 protected:
     void SetUp() override {
@@ -459,8 +465,6 @@ protected:
         fake_vendor_set_slot_count(2);
         const CK_SESSION_HANDLE session = openUserSession();
         createData(session, "label-one");
-        createData(session, "label-two");
-        createSensitiveKey(session);
         fake_vendor_clear_calls();
     }
 };

@@ -172,21 +172,6 @@ protected:
         return object;
     }
 
-    // A sensitive secret key, whose CKA_VALUE the module refuses to reveal.
-    CK_OBJECT_HANDLE createSensitiveKey(CK_SESSION_HANDLE session) {
-        CK_OBJECT_CLASS cls = CKO_SECRET_KEY;
-        CK_KEY_TYPE type = CKK_GENERIC_SECRET;
-        CK_BBOOL yes = CK_TRUE;
-        CK_BYTE value[16] = {1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 13, 14, 15, 16};
-        CK_ATTRIBUTE tmpl[] = {{CKA_CLASS, &cls, sizeof cls},
-                               {CKA_KEY_TYPE, &type, sizeof type},
-                               {CKA_SENSITIVE, &yes, sizeof yes},
-                               {CKA_VALUE, value, sizeof value}};
-        CK_OBJECT_HANDLE key = 0;
-        EXPECT_EQ(CKR_OK, module_->C_CreateObject(session, tmpl, 4, &key));
-        return key;
-    }
-
     CK_FUNCTION_LIST_PTR module_ = nullptr;
 };
 
