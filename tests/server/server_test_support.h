@@ -85,85 +85,53 @@ inline void PrintTo(const FrameRow& row, std::ostream* os) { *os << row.command;
 
 // Every handler: its command, the module function it calls, its answer
 // sub-message, and the name it answers under where that is not the command.
+// FRAME: the module function has the command's name.
+#define FRAME(command, answer) {#command, command##_Server, #command, answer}
+// clang-format off
 inline const FrameRow kFrameRows[] = {
-    {"C_Initialize", C_Initialize_Server, "C_Initialize", nullptr},
-    {"C_Finalize", C_Finalize_Server, "C_Finalize", nullptr},
-    {"C_GetInfo", C_GetInfo_Server, "C_GetInfo", ANSWER(infores)},
-    {"C_GetSlotList", C_GetSlotList_Server, "C_GetSlotList", ANSWER(slotlistres)},
-    {"C_GetSlotInfo", C_GetSlotInfo_Server, "C_GetSlotInfo", ANSWER(slotinfores)},
-    {"C_GetTokenInfo", C_GetTokenInfo_Server, "C_GetTokenInfo", ANSWER(tokeninfores)},
-    {"C_GetMechanismList", C_GetMechanismList_Server, "C_GetMechanismList",
-     ANSWER(mechanismlistres)},
-    {"C_GetMechanismInfo", C_GetMechanismInfo_Server, "C_GetMechanismInfo",
-     ANSWER(mechanisminfores)},
-    {"C_InitToken", C_InitToken_Server, "C_InitToken", nullptr},
+    FRAME(C_Initialize, nullptr), FRAME(C_Finalize, nullptr), FRAME(C_GetInfo, ANSWER(infores)),
+    FRAME(C_GetSlotList, ANSWER(slotlistres)), FRAME(C_GetSlotInfo, ANSWER(slotinfores)),
+    FRAME(C_GetTokenInfo, ANSWER(tokeninfores)),
+    FRAME(C_GetMechanismList, ANSWER(mechanismlistres)),
+    FRAME(C_GetMechanismInfo, ANSWER(mechanisminfores)), FRAME(C_InitToken, nullptr),
     {"C_InitPin", C_InitPin_Server, "C_InitPIN", nullptr},
-    {"C_SetPin", C_SetPin_Server, "C_SetPIN", nullptr},
-    {"C_OpenSession", C_OpenSession_Server, "C_OpenSession", ANSWER(opensesres)},
-    {"C_CloseSession", C_CloseSession_Server, "C_CloseSession", nullptr},
-    {"C_CloseAllSessions", C_CloseAllSessions_Server, "C_CloseAllSessions", nullptr},
-    {"C_GetSessionInfo", C_GetSessionInfo_Server, "C_GetSessionInfo", ANSWER(sessioninfores)},
-    {"C_GetOperationState", C_GetOperationState_Server, "C_GetOperationState",
-     ANSWER(getoperationstateres)},
-    {"C_SetOperationState", C_SetOperationState_Server, "C_SetOperationState", nullptr},
-    {"C_Login", C_Login_Server, "C_Login", nullptr},
-    {"C_Logout", C_Logout_Server, "C_Logout", nullptr},
-    {"C_CreateObject", C_CreateObject_Server, "C_CreateObject", ANSWER(createobjectres)},
-    {"C_CopyObject", C_CopyObject_Server, "C_CopyObject", ANSWER(copyobjectres)},
-    {"C_DestroyObject", C_DestroyObject_Server, "C_DestroyObject", nullptr},
-    {"C_GetObjectSize", C_GetObjectSize_Server, "C_GetObjectSize", ANSWER(getobjectsizeres)},
-    {"C_GetAttributeValue", C_GetAttributeValue_Server, "C_GetAttributeValue", ANSWER(attvalueres)},
-    {"C_SetAttributeValue", C_SetAttributeValue_Server, "C_SetAttributeValue",
-     ANSWER(setattributevalueres)},
-    {"C_FindObjectsInit", C_FindObjectsInit_Server, "C_FindObjectsInit", ANSWER(findobjintres)},
-    {"C_FindObjects", C_FindObjects_Server, "C_FindObjects", ANSWER(findobjres)},
-    {"C_FindObjectsFinal", C_FindObjectsFinal_Server, "C_FindObjectsFinal", nullptr},
-    {"C_EncryptInit", C_EncryptInit_Server, "C_EncryptInit", nullptr},
-    {"C_Encrypt", C_Encrypt_Server, "C_Encrypt", ANSWER(encres)},
-    {"C_EncryptUpdate", C_EncryptUpdate_Server, "C_EncryptUpdate", ANSWER(encryptupdateres)},
-    {"C_EncryptFinal", C_EncryptFinal_Server, "C_EncryptFinal", ANSWER(encryptfinalres)},
-    {"C_DecryptInit", C_DecryptInit_Server, "C_DecryptInit", nullptr},
-    {"C_Decrypt", C_Decrypt_Server, "C_Decrypt", ANSWER(decres)},
-    {"C_DecryptUpdate", C_DecryptUpdate_Server, "C_DecryptUpdate", ANSWER(decryptupdateres)},
-    {"C_DecryptFinal", C_DecryptFinal_Server, "C_DecryptFinal", ANSWER(decryptfinalres)},
-    {"C_DigestInit", C_DigestInit_Server, "C_DigestInit", nullptr},
-    {"C_Digest", C_Digest_Server, "C_Digest", ANSWER(digestres)},
-    {"C_DigestUpdate", C_DigestUpdate_Server, "C_DigestUpdate", nullptr},
-    {"C_DigestKey", C_DigestKey_Server, "C_DigestKey", nullptr},
-    {"C_DigestFinal", C_DigestFinal_Server, "C_DigestFinal", ANSWER(digestfinalres)},
-    {"C_SignInit", C_SignInit_Server, "C_SignInit", nullptr},
-    {"C_Sign", C_Sign_Server, "C_Sign", ANSWER(signres)},
-    {"C_SignUpdate", C_SignUpdate_Server, "C_SignUpdate", nullptr},
-    {"C_SignFinal", C_SignFinal_Server, "C_SignFinal", ANSWER(signfinalres)},
-    {"C_SignRecoverInit", C_SignRecoverInit_Server, "C_SignRecoverInit", nullptr},
-    {"C_SignRecover", C_SignRecover_Server, "C_SignRecover", ANSWER(signrecoverres)},
-    {"C_VerifyInit", C_VerifyInit_Server, "C_VerifyInit", nullptr},
-    {"C_Verify", C_Verify_Server, "C_Verify", ANSWER(verifyres)},
-    {"C_VerifyUpdate", C_VerifyUpdate_Server, "C_VerifyUpdate", nullptr},
-    {"C_VerifyFinal", C_VerifyFinal_Server, "C_VerifyFinal", nullptr},
-    {"C_VerifyRecoverInit", C_VerifyRecoverInit_Server, "C_VerifyRecoverInit", nullptr},
-    {"C_VerifyRecover", C_VerifyRecover_Server, "C_VerifyRecover", ANSWER(verifyrecoverres)},
-    {"C_DigestEncryptUpdate", C_DigestEncryptUpdate_Server, "C_DigestEncryptUpdate",
-     ANSWER(digestencryptupdateres)},
-    {"C_DecryptDigestUpdate", C_DecryptDigestUpdate_Server, "C_DecryptDigestUpdate",
-     ANSWER(decryptdigestupdateres)},
-    {"C_SignEncryptUpdate", C_SignEncryptUpdate_Server, "C_SignEncryptUpdate",
-     ANSWER(signencryptupdateres)},
-    {"C_DecryptVerifyUpdate", C_DecryptVerifyUpdate_Server, "C_DecryptVerifyUpdate",
-     ANSWER(decryptverifyupdateres)},
-    {"C_GenerateKey", C_GenerateKey_Server, "C_GenerateKey", ANSWER(generatekeyres)},
-    {"C_GenerateKeyPair", C_GenerateKeyPair_Server, "C_GenerateKeyPair",
-     ANSWER(generatekeypairres)},
-    {"C_WrapKey", C_WrapKey_Server, "C_WrapKey", ANSWER(wrapkeyres)},
+    {"C_SetPin", C_SetPin_Server, "C_SetPIN", nullptr}, FRAME(C_OpenSession, ANSWER(opensesres)),
+    FRAME(C_CloseSession, nullptr), FRAME(C_CloseAllSessions, nullptr),
+    FRAME(C_GetSessionInfo, ANSWER(sessioninfores)),
+    FRAME(C_GetOperationState, ANSWER(getoperationstateres)), FRAME(C_SetOperationState, nullptr),
+    FRAME(C_Login, nullptr), FRAME(C_Logout, nullptr),
+    FRAME(C_CreateObject, ANSWER(createobjectres)), FRAME(C_CopyObject, ANSWER(copyobjectres)),
+    FRAME(C_DestroyObject, nullptr), FRAME(C_GetObjectSize, ANSWER(getobjectsizeres)),
+    FRAME(C_GetAttributeValue, ANSWER(attvalueres)),
+    FRAME(C_SetAttributeValue, ANSWER(setattributevalueres)),
+    FRAME(C_FindObjectsInit, ANSWER(findobjintres)), FRAME(C_FindObjects, ANSWER(findobjres)),
+    FRAME(C_FindObjectsFinal, nullptr), FRAME(C_EncryptInit, nullptr),
+    FRAME(C_Encrypt, ANSWER(encres)), FRAME(C_EncryptUpdate, ANSWER(encryptupdateres)),
+    FRAME(C_EncryptFinal, ANSWER(encryptfinalres)), FRAME(C_DecryptInit, nullptr),
+    FRAME(C_Decrypt, ANSWER(decres)), FRAME(C_DecryptUpdate, ANSWER(decryptupdateres)),
+    FRAME(C_DecryptFinal, ANSWER(decryptfinalres)), FRAME(C_DigestInit, nullptr),
+    FRAME(C_Digest, ANSWER(digestres)), FRAME(C_DigestUpdate, nullptr), FRAME(C_DigestKey, nullptr),
+    FRAME(C_DigestFinal, ANSWER(digestfinalres)), FRAME(C_SignInit, nullptr),
+    FRAME(C_Sign, ANSWER(signres)), FRAME(C_SignUpdate, nullptr),
+    FRAME(C_SignFinal, ANSWER(signfinalres)), FRAME(C_SignRecoverInit, nullptr),
+    FRAME(C_SignRecover, ANSWER(signrecoverres)), FRAME(C_VerifyInit, nullptr),
+    FRAME(C_Verify, ANSWER(verifyres)), FRAME(C_VerifyUpdate, nullptr),
+    FRAME(C_VerifyFinal, nullptr), FRAME(C_VerifyRecoverInit, nullptr),
+    FRAME(C_VerifyRecover, ANSWER(verifyrecoverres)),
+    FRAME(C_DigestEncryptUpdate, ANSWER(digestencryptupdateres)),
+    FRAME(C_DecryptDigestUpdate, ANSWER(decryptdigestupdateres)),
+    FRAME(C_SignEncryptUpdate, ANSWER(signencryptupdateres)),
+    FRAME(C_DecryptVerifyUpdate, ANSWER(decryptverifyupdateres)),
+    FRAME(C_GenerateKey, ANSWER(generatekeyres)),
+    FRAME(C_GenerateKeyPair, ANSWER(generatekeypairres)), FRAME(C_WrapKey, ANSWER(wrapkeyres)),
     {"C_UnWrapKey", C_UnWrapKey_Server, "C_UnwrapKey", ANSWER(unwrapkeyres)},
     {"C_DeriveKey", C_DeriveKey_Server, "C_DeriveKey", ANSWER(derivekeyres), "C_UnDeriveKey"},
-    {"C_GenerateRandom", C_GenerateRandom_Server, "C_GenerateRandom", ANSWER(generaterandomres)},
-    {"C_SeedRandom", C_SeedRandom_Server, "C_SeedRandom", ANSWER(seedrandomres)},
-    {"C_GetFunctionStatus", C_GetFunctionStatus_Server, "C_GetFunctionStatus", nullptr},
-    {"C_CancelFunction", C_CancelFunction_Server, "C_CancelFunction", nullptr},
-    {"C_WaitForSlotEvent", C_WaitForSlotEvent_Server, "C_WaitForSlotEvent",
-     ANSWER(waitforsloteventres)},
+    FRAME(C_GenerateRandom, ANSWER(generaterandomres)), FRAME(C_SeedRandom, ANSWER(seedrandomres)),
+    FRAME(C_GetFunctionStatus, nullptr), FRAME(C_CancelFunction, nullptr),
+    FRAME(C_WaitForSlotEvent, ANSWER(waitforsloteventres)),
 };
+// clang-format on
+#undef FRAME
 
 inline const FrameRow& frameOf(const std::string& command) {
     for (const FrameRow& row : kFrameRows)
@@ -202,21 +170,6 @@ protected:
         CK_OBJECT_HANDLE object = 0;
         EXPECT_EQ(CKR_OK, module_->C_CreateObject(session, tmpl, 2, &object));
         return object;
-    }
-
-    // A sensitive secret key, whose CKA_VALUE the module refuses to reveal.
-    CK_OBJECT_HANDLE createSensitiveKey(CK_SESSION_HANDLE session) {
-        CK_OBJECT_CLASS cls = CKO_SECRET_KEY;
-        CK_KEY_TYPE type = CKK_GENERIC_SECRET;
-        CK_BBOOL yes = CK_TRUE;
-        CK_BYTE value[16] = {1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 13, 14, 15, 16};
-        CK_ATTRIBUTE tmpl[] = {{CKA_CLASS, &cls, sizeof cls},
-                               {CKA_KEY_TYPE, &type, sizeof type},
-                               {CKA_SENSITIVE, &yes, sizeof yes},
-                               {CKA_VALUE, value, sizeof value}};
-        CK_OBJECT_HANDLE key = 0;
-        EXPECT_EQ(CKR_OK, module_->C_CreateObject(session, tmpl, 4, &key));
-        return key;
     }
 
     CK_FUNCTION_LIST_PTR module_ = nullptr;
