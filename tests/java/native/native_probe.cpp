@@ -165,6 +165,18 @@ JNIEXPORT void JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_setNextVendorRv
         throwIllegalState(env, "fake_vendor_set_next_rv refused");
 }
 
+JNIEXPORT void JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_setNextVendorOutput(
+    JNIEnv* env, jclass, jlong vendor, jstring function, jbyteArray bytes) {
+    auto setNextOutput = reinterpret_cast<CK_RV (*)(const char*, const CK_BYTE*, CK_ULONG)>(
+        vendorSymbol(env, vendor, "fake_vendor_set_next_output"));
+    if (setNextOutput == nullptr) return;
+    std::vector<CK_BYTE> data(static_cast<size_t>(env->GetArrayLength(bytes)));
+    env->GetByteArrayRegion(bytes, 0, static_cast<jsize>(data.size()),
+                            reinterpret_cast<jbyte*>(data.data()));
+    if (setNextOutput(utf(env, function).c_str(), data.data(), data.size()) != CKR_OK)
+        throwIllegalState(env, "fake_vendor_set_next_output refused");
+}
+
 // The fake vendor's record as text, one element per call.
 JNIEXPORT jobjectArray JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_vendorCalls(JNIEnv* env,
                                                                                      jclass,
@@ -189,16 +201,6 @@ JNIEXPORT void JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_resetVendor(JNI
                                                                              jlong vendor) {
     if (auto reset = reinterpret_cast<void (*)()>(vendorSymbol(env, vendor, "fake_vendor_reset")))
         reset();
-}
-
-// Calls a control of the fake vendor that takes one CK_ULONG
-// ("fake_vendor_set_signature_length").
-JNIEXPORT void JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_controlVendor(JNIEnv* env, jclass,
-                                                                               jlong vendor,
-                                                                               jstring control,
-                                                                               jlong value) {
-    if (void* symbol = vendorSymbol(env, vendor, utf(env, control).c_str()))
-        reinterpret_cast<void (*)(CK_ULONG)>(symbol)(static_cast<CK_ULONG>(value));
 }
 
 JNIEXPORT void JNICALL Java_com_vok_smartcard_pkcs11_NativeProbe_closeVendor(JNIEnv*, jclass,

@@ -32,6 +32,9 @@ final class NativeProbe {
     /** The next call of {@code function} in the fake vendor returns {@code rv}. */
     static native void setNextVendorRv(long vendor, String function, long rv);
 
+    /** The next call of {@code function} in the fake vendor writes {@code bytes} to its output. */
+    static native void setNextVendorOutput(long vendor, String function, byte[] bytes);
+
     static native void closeVendor(long vendor);
 
     /** A fresh token in the fake vendor, with an empty call record. */
@@ -39,9 +42,6 @@ final class NativeProbe {
 
     /** The fake vendor's call record, one text per call (see fake_vendor.h). */
     static native String[] vendorCalls(long vendor);
-
-    /** Calls a {@code fake_vendor_} control that takes one {@code CK_ULONG}. */
-    static native void controlVendor(long vendor, String control, long value);
 
     /** From now on the process's log lines are kept instead of printed. */
     static native void captureLog();

@@ -55,12 +55,7 @@ class Pkcs11MethodsTest {
     private static Pkcs11 p11;
     private static long vendor;
 
-    private byte[] signature;
     private byte[] cipher;
-    private byte[] digest;
-    private byte[] state;
-    private byte[] recoverable;
-    private byte[] wrapped;
     private final byte[] random = new byte[8];
     private final CK_ATTRIBUTE[] readBack = {new CK_ATTRIBUTE(CKA_LABEL, "old".toCharArray()),
         new CK_ATTRIBUTE(CKA_CLASS), new CK_ATTRIBUTE(CKA_SIGN), new CK_ATTRIBUTE(CKA_VALUE)};
@@ -133,6 +128,15 @@ class Pkcs11MethodsTest {
 
     private static Consumer<Object> is(Object expected) {
         return r -> assertEquals(expected, r);
+    }
+
+    /** The module is told what to answer; exactly those bytes come back to Java. */
+    private static Row answers(String function, int calls, byte[] reply, Step step,
+            String... seen) {
+        return row(function, calls, () -> {
+            NativeProbe.setNextVendorOutput(vendor, function, reply);
+            return step.run();
+        }, isBytes(reply), seen);
     }
 
     private static Consumer<Object> isBytes(byte[] expected) {
@@ -220,21 +224,19 @@ class Pkcs11MethodsTest {
                 "pMechanism 0 0 - 1 529 1 0 -", "hKey 1 4294967297 - 0"),
             call("C_SignUpdate", () -> p11.C_SignUpdate(SESSION, DATA), "pPart 0 0 616263 0",
                 "ulPartLen 1 3 - 0"),
-            row("C_SignFinal", 2, () -> signature = p11.C_SignFinal(SESSION), lengthIs(16),
+            answers("C_SignFinal", 2, reply(0x10, 16), () -> p11.C_SignFinal(SESSION),
                 "first:pSignature 1 0 - 0", "pulSignatureLen 0 16 - 0"),
-            call("C_SignInit", () -> p11.C_SignInit(SESSION, hmac, HMAC)),
-            row("C_Sign", 1, () -> p11.C_Sign(SESSION, DATA), r -> isBytes(signature).accept(r),
+            answers("C_Sign", 1, reply(0x20, 20), () -> p11.C_Sign(SESSION, DATA),
                 "pData 0 0 616263 0", "pulSignatureLen 0 512 - 0"),
-            call("C_VerifyInit", () -> p11.C_VerifyInit(SESSION, hmac, HMAC),
-                "pMechanism 0 0 - 1 529 1 0 -"),
-            call("C_VerifyUpdate", () -> p11.C_VerifyUpdate(SESSION, DATA), "pPart 0 0 616263 0"),
-            row("C_VerifyFinal", 1, v(() -> p11.C_VerifyFinal(SESSION, signature)),
-                r -> seenLast("C_VerifyFinal", "pSignature 0 0 " + hex(signature) + " 0"),
-                "ulSignatureLen 1 16 - 0"),
-            call("C_VerifyInit", () -> p11.C_VerifyInit(SESSION, hmac, HMAC)),
-            row("C_Verify", 1, v(() -> p11.C_Verify(SESSION, DATA, signature)),
-                r -> seenLast("C_Verify", "pSignature 0 0 " + hex(signature) + " 0"),
-                "pData 0 0 616263 0", "ulSignatureLen 1 16 - 0"),
+            call("C_VerifyInit", () -> p11.C_VerifyInit(SESSION, x509, RSA_PUBLIC),
+                "pMechanism 0 0 - 1 3 1 0 -", "hKey 1 4294967300 - 0"),
+            call("C_VerifyUpdate", () -> p11.C_VerifyUpdate(SESSION, BLOCK), "pPart 0 0 "
+                + hex(BLOCK) + " 0"),
+            call("C_VerifyFinal", () -> p11.C_VerifyFinal(SESSION, reply(0x30, 15)),
+                "pSignature 0 0 " + hex(reply(0x30, 15)) + " 0", "ulSignatureLen 1 15 - 0"),
+            call("C_Verify", () -> p11.C_Verify(SESSION, DATA, reply(0x40, 14)),
+                "pData 0 0 616263 0", "pSignature 0 0 " + hex(reply(0x40, 14)) + " 0",
+                "ulSignatureLen 1 14 - 0"),
             row("C_GenerateKey", 1, () -> p11.C_GenerateKey(SESSION, new CK_MECHANISM(0x1080),
                 aesKeyTemplate()), is(AES), "pMechanism 0 0 - 1 4224 1 0 -", "pTemplate 0 0 - 5"
                     + " 353 0 8 1000000000000000 260 0 1 01 261 0 1 01 262 0 1 01 263 0 1 01"),
@@ -263,40 +265,36 @@ class Pkcs11MethodsTest {
                 "first:pLastPart 1 0 - 0"),
             call("C_DigestInit", () -> p11.C_DigestInit(SESSION, sha256),
                 "pMechanism 0 0 - 1 592 1 0 -"),
-            row("C_Digest", 1, () -> digest = p11.C_Digest(SESSION, DATA), lengthIs(32),
+            answers("C_Digest", 1, reply(0x50, 32), () -> p11.C_Digest(SESSION, DATA),
                 "pData 0 0 616263 0", "pulDigestLen 0 65 - 0"),
-            call("C_DigestInit", () -> p11.C_DigestInit(SESSION, sha256)),
-            call("C_DigestUpdate", () -> p11.C_DigestUpdate(SESSION, DATA), "pPart 0 0 616263 0"),
+            call("C_DigestUpdate", () -> p11.C_DigestUpdate(SESSION, IV), "pPart 0 0 " + hex(IV)
+                + " 0"),
             call("C_DigestKey", () -> p11.C_DigestKey(SESSION, AES), "hKey 1 4294967299 - 0"),
-            row("C_DigestFinal", 2, () -> p11.C_DigestFinal(SESSION), r -> assertFalse(
-                Arrays.equals(digest, (byte[]) r), "the key was digested too"),
-                "first:pDigest 1 0 - 0", "pulDigestLen 0 32 - 0"),
-            call("C_DigestInit", () -> p11.C_DigestInit(SESSION, sha256)),
-            row("C_GetOperationState", 2, () -> state = p11.C_GetOperationState(SESSION),
-                r -> assertTrue(((byte[]) r).length > 0), "first:pOperationState 1 0 - 0"),
-            row("C_SetOperationState", 1, v(() -> p11.C_SetOperationState(SESSION, state, 0, 0)),
-                r -> seenLast("C_SetOperationState", "pOperationState 0 0 " + hex(state) + " 0"),
-                "hEncryptionKey 1 0 - 0", "hAuthenticationKey 1 0 - 0"),
-            call("C_EncryptInit", () -> p11.C_EncryptInit(SESSION, ecb, AES)),
-            row("C_DigestEncryptUpdate", 2, () -> p11.C_DigestEncryptUpdate(SESSION, BLOCK),
-                r -> isBytes(cipher).accept(r), "first:pEncryptedPart 1 0 - 0",
-                "ulPartLen 1 16 - 0"),
-            call("C_DecryptInit", () -> p11.C_DecryptInit(SESSION, ecb, AES)),
-            row("C_DecryptDigestUpdate", 2, () -> p11.C_DecryptDigestUpdate(SESSION, cipher),
-                isBytes(BLOCK), "first:pPart 1 0 - 0", "ulEncryptedPartLen 1 16 - 0"),
-            call("C_SignInit", () -> p11.C_SignInit(SESSION, hmac, HMAC)),
-            row("C_SignEncryptUpdate", 2, () -> p11.C_SignEncryptUpdate(SESSION, BLOCK),
-                r -> isBytes(cipher).accept(r), "first:pEncryptedPart 1 0 - 0"),
-            // C_Sign (its operation still runs) offers 512 bytes, then asks again with the
-            // length the module names.
-            row("C_Sign", 2, () -> {
-                NativeProbe.controlVendor(vendor, "fake_vendor_set_signature_length", 600);
-                return p11.C_Sign(SESSION, DATA);
-            }, lengthIs(600), "first:C_Sign 336\n", "first:pulSignatureLen 0 512 - 0",
+            answers("C_DigestFinal", 2, reply(0x60, 31), () -> p11.C_DigestFinal(SESSION),
+                "first:pDigest 1 0 - 0", "pulDigestLen 0 31 - 0"),
+            answers("C_GetOperationState", 2, reply(0x70, 12),
+                () -> p11.C_GetOperationState(SESSION), "first:pOperationState 1 0 - 0",
+                "pulOperationStateLen 0 12 - 0"),
+            call("C_SetOperationState", () -> p11.C_SetOperationState(SESSION, reply(0x80, 11),
+                AES, HMAC), "pOperationState 0 0 " + hex(reply(0x80, 11)) + " 0",
+                "ulOperationStateLen 1 11 - 0", "hEncryptionKey 1 4294967299 - 0",
+                "hAuthenticationKey 1 4294967297 - 0"),
+            answers("C_DigestEncryptUpdate", 2, reply(0x90, 17),
+                () -> p11.C_DigestEncryptUpdate(SESSION, BLOCK), "first:pEncryptedPart 1 0 - 0",
+                "pPart 0 0 " + hex(BLOCK) + " 0", "pulEncryptedPartLen 0 17 - 0"),
+            answers("C_DecryptDigestUpdate", 2, reply(0xa0, 18),
+                () -> p11.C_DecryptDigestUpdate(SESSION, IV), "first:pPart 1 0 - 0",
+                "pEncryptedPart 0 0 " + hex(IV) + " 0", "pulPartLen 0 18 - 0"),
+            answers("C_SignEncryptUpdate", 2, reply(0xb0, 19),
+                () -> p11.C_SignEncryptUpdate(SESSION, DATA), "first:pEncryptedPart 1 0 - 0",
+                "pPart 0 0 616263 0", "pulEncryptedPartLen 0 19 - 0"),
+            answers("C_DecryptVerifyUpdate", 2, reply(0xc0, 21),
+                () -> p11.C_DecryptVerifyUpdate(SESSION, reply(0xd0, 5)), "first:pPart 1 0 - 0",
+                "pEncryptedPart 0 0 " + hex(reply(0xd0, 5)) + " 0", "pulPartLen 0 21 - 0"),
+            // C_Sign offers 512 bytes, then asks again with the length the module names.
+            answers("C_Sign", 2, reply(0xe0, 600), () -> p11.C_Sign(SESSION, DATA),
+                "first:C_Sign 336\n", "first:pulSignatureLen 0 512 - 0",
                 "pulSignatureLen 0 600 - 0"),
-            call("C_VerifyInit", () -> p11.C_VerifyInit(SESSION, hmac, HMAC)),
-            row("C_DecryptVerifyUpdate", 2, () -> p11.C_DecryptVerifyUpdate(SESSION, cipher),
-                isBytes(BLOCK), "first:pPart 1 0 - 0"),
             row("C_GenerateKeyPair", 1, () -> p11.C_GenerateKeyPair(SESSION, new CK_MECHANISM(0),
                 new CK_ATTRIBUTE[] {new CK_ATTRIBUTE(0x121, 512L), new CK_ATTRIBUTE(0x10B, true)},
                 new CK_ATTRIBUTE[] {new CK_ATTRIBUTE(0x109, true)}),
@@ -306,18 +304,19 @@ class Pkcs11MethodsTest {
                 "pPrivateKeyTemplate 0 0 - 1 265 0 1 01"),
             call("C_SignRecoverInit", () -> p11.C_SignRecoverInit(SESSION, x509, RSA_PRIVATE),
                 "pMechanism 0 0 - 1 3 1 0 -", "hKey 1 4294967301 - 0"),
-            row("C_SignRecover", 2, () -> recoverable = p11.C_SignRecover(SESSION, DATA),
-                lengthIs(4), "first:pSignature 1 0 - 0", "pData 0 0 616263 0"),
+            answers("C_SignRecover", 2, reply(0xf0, 4), () -> p11.C_SignRecover(SESSION, DATA),
+                "first:pSignature 1 0 - 0", "pData 0 0 616263 0", "pulSignatureLen 0 4 - 0"),
             call("C_VerifyRecoverInit", () -> p11.C_VerifyRecoverInit(SESSION, x509, RSA_PUBLIC),
                 "hKey 1 4294967300 - 0"),
-            row("C_VerifyRecover", 2, () -> p11.C_VerifyRecover(SESSION, recoverable),
-                isBytes(DATA), "first:pData 1 0 - 0", "ulSignatureLen 1 4 - 0"),
-            row("C_WrapKey", 2, () -> wrapped = p11.C_WrapKey(SESSION, ecb, AES, HMAC),
-                lengthIs(16), "first:pWrappedKey 1 0 - 0", "hWrappingKey 1 4294967299 - 0",
-                "hKey 1 4294967297 - 0"),
-            row("C_UnwrapKey", 1, () -> p11.C_UnwrapKey(SESSION, ecb, AES, wrapped,
+            answers("C_VerifyRecover", 2, reply(0x15, 3), () -> p11.C_VerifyRecover(SESSION,
+                reply(0x25, 4)), "first:pData 1 0 - 0", "pSignature 0 0 " + hex(reply(0x25, 4))
+                + " 0", "pulDataLen 0 3 - 0"),
+            answers("C_WrapKey", 2, reply(0x35, 24), () -> p11.C_WrapKey(SESSION, ecb, AES, HMAC),
+                "first:pWrappedKey 1 0 - 0", "hWrappingKey 1 4294967299 - 0",
+                "hKey 1 4294967297 - 0", "pulWrappedKeyLen 0 24 - 0"),
+            row("C_UnwrapKey", 1, () -> p11.C_UnwrapKey(SESSION, ecb, AES, reply(0x45, 16),
                 secretTemplate()), is(HMAC + 5), "hUnwrappingKey 1 4294967299 - 0",
-                "ulWrappedKeyLen 1 16 - 0",
+                "pWrappedKey 0 0 " + hex(reply(0x45, 16)) + " 0", "ulWrappedKeyLen 1 16 - 0",
                 "pTemplate 0 0 - 2 0 0 8 0400000000000000 256 0 8 1000000000000000"),
             row("C_DeriveKey", 1, () -> p11.C_DeriveKey(SESSION, new CK_MECHANISM(0x393), HMAC,
                 secretTemplate()), is(HMAC + 6), "pMechanism 0 0 - 1 915 1 0 -",
@@ -398,11 +397,13 @@ class Pkcs11MethodsTest {
         p11.C_Initialize(null);
         p11.C_OpenSession(SLOT, CKF_RW_SERIAL, null);
         p11.C_DigestInit(SESSION, new CK_MECHANISM(0x250));
+        NativeProbe.setNextVendorOutput(vendor, "C_Digest", reply(1, 32));
         NativeProbe.captureLog();
         byte[] first = p11.C_Digest(SESSION, DATA);
         assertEquals(Arrays.asList("3|Java_com_vok_smartcard_pkcs11_Pkcs11_C_1Digest"),
                 Arrays.asList(NativeProbe.takeLog("%s")));
         p11.C_DigestInit(SESSION, new CK_MECHANISM(0x250));
+        NativeProbe.setNextVendorOutput(vendor, "C_Digest", reply(1, 32));
         NativeProbe.captureLog();
         assertArrayEquals(first, p11.C_Digest(SESSION, DATA));
         List<String> lines = Arrays.asList(NativeProbe.takeLog("[native jni pkcs11wrapper]"));
@@ -483,6 +484,11 @@ class Pkcs11MethodsTest {
 
     private static char[] chars(String text) {
         return text.toCharArray();
+    }
+
+    /** Bytes no other row's answer has: its own start and length. */
+    private static byte[] reply(int first, int length) {
+        return bytes(length, first, 7);
     }
 
     private static byte[] bytes(int length, int first, int step) {
