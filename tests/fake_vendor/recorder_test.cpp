@@ -83,7 +83,9 @@ TEST_F(FakeVendorTest, RecordsWhatArrivedAsItArrived) {
                                                "pulEncryptedDataLen"}));
 
     int app = 0;
-    CK_NOTIFY notify = [](CK_SESSION_HANDLE, CK_NOTIFICATION, CK_VOID_PTR) { return CKR_OK; };
+    CK_NOTIFY notify = [](CK_SESSION_HANDLE, CK_NOTIFICATION, CK_VOID_PTR) -> CK_RV {
+        return CKR_OK;
+    };
     CK_SESSION_HANDLE h = 0;
     ASSERT_EQ(f->C_OpenSession(FAKE_VENDOR_SLOT_ID, CKF_SERIAL_SESSION, &app, notify, &h), CKR_OK);
     const Call plain = callsOf("C_OpenSession").at(0), withCallback = lastCall("C_OpenSession");
